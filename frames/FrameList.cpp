@@ -1,0 +1,374 @@
+#include "FrameList.h"
+
+#include <algorithm>
+
+#include "Log.h"
+#include "Trace.h"
+#include "UniqueLock.h"
+
+namespace android {
+
+using Interpolation::EventDispatcher;
+using Interpolation::EventType;
+using Interpolation::UniqueLock;
+
+void FrameList::FrameDeque::insert(const_iterator position, const FrameItem& frame) {
+    mFrames.insert(position, frame);
+    broadcastEvent<Interpolation::eFrameReceivedEvent>(frame);
+}
+
+FrameItem FrameList::FrameDeque::erase(const_iterator position) {
+    auto it = mFrames.begin() + (position - mFrames.cbegin());
+    FrameItem removed = std::move(*it);
+    mFrames.erase(it);
+    broadcastEvent<Interpolation::eFrameReleasedEvent>(removed);
+    return removed;
+}
+
+template <EventType type>
+void FrameList::FrameDeque::broadcastEvent(const FrameItem& frame) {
+    static_assert(type == Interpolation::eFrameReceivedEvent ||
+                  type == Interpolation::eFrameReleasedEvent);
+    const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
+    const int size = static_cast<int>(mFrames.size());
+    const int sizeBefore = type == Interpolation::eFrameReceivedEvent ? size - 1 : size + 1;
+    EventDispatcher::broadcastEvent(mUid, type, now, frame);
+    EventDispatcher::broadcastEvent(mUid, Interpolation::eFrameListSizeChangedEvent, now - 1,
+                                    sizeBefore);
+    EventDispatcher::broadcastEvent(mUid, Interpolation::eFrameListSizeChangedEvent, now, size);
+}
+
+FrameList::FrameList(uint32_t uid) : mFrames(uid) {
+    // Enough for every frame a composition can hold at once; more only grows the vector.
+    mLocks.reserve(8);
+}
+
+void FrameList::insertFrame(FrameItem frame) {
+    std::lock_guard lock(mMutex);
+    ILOG(2, "Interpolation::FrameList insertFrame frame %lu", frame.mID);
+    for (size_t i = 0; i < mFrames.size(); i++) {
+        if (mFrames[i].mTimestamp == frame.mTimestamp) {
+            ILOG(2, "Interpolation::FrameList attempted to insert duplicate frame %lu", frame.mID);
+            mFrames[i].update(frame);
+            return;
+        }
+    }
+    insertFrameLocked(frame);
+}
+
+void FrameList::insertFrameLocked(const FrameItem& frame) {
+    // Behind frames of equal mID, so that they keep their order of arrival.
+    auto position = std::find_if(mFrames.begin(), mFrames.end(),
+                                 [&](const FrameItem& queued) { return queued.mID > frame.mID; });
+    mFrames.insert(position, frame);
+}
+
+void FrameList::replaceFrame(FrameItem out, FrameItem in) {
+    std::lock_guard lock(mMutex);
+    ILOG(2, "Interpolation::FrameList replaceFrame out : %lu, in : %lu", out.mID, in.mID);
+    auto found = std::find_if(mFrames.begin(), mFrames.end(), [&](const FrameItem& queued) {
+        return queued.mTimestamp == out.mTimestamp;
+    });
+    if (found == mFrames.end()) {
+        ILOG(1, "Interpolation::FrameList unable to find frame to replace!");
+        return;
+    }
+    mFrames.erase(found);
+    insertFrameLocked(in);
+}
+
+bool FrameList::hasFrameLocked(const FrameItem& frame) const {
+    return std::any_of(mFrames.begin(), mFrames.end(), [&](const FrameItem& queued) {
+        return queued.mTimestamp == frame.mTimestamp;
+    });
+}
+
+size_t FrameList::size() const {
+    std::lock_guard lock(mMutex);
+    return mFrames.size();
+}
+
+FrameItem FrameList::getOldestFrame() const {
+    std::lock_guard lock(mMutex);
+    return mFrames.empty() ? FrameItem() : mFrames.front();
+}
+
+FrameItem FrameList::getNewestFrame() const {
+    std::lock_guard lock(mMutex);
+    return mFrames.empty() ? FrameItem() : mFrames.back();
+}
+
+bool FrameList::hasFrameAt(const nsecs_t& t) const {
+    std::lock_guard lock(mMutex);
+    return hasFrameAtLocked(t);
+}
+
+bool FrameList::hasFrameAtLocked(nsecs_t t) const {
+    return std::any_of(mFrames.begin(), mFrames.end(),
+                       [&](const FrameItem& queued) { return queued.mID == t; });
+}
+
+FrameItem FrameList::getFrameAtLocked(nsecs_t t) const {
+    auto found = std::find_if(mFrames.begin(), mFrames.end(),
+                              [&](const FrameItem& queued) { return queued.mID == t; });
+    return found == mFrames.end() ? FrameItem() : *found;
+}
+
+FrameItem FrameList::getFrameAt(const nsecs_t& t) {
+    std::lock_guard lock(mMutex);
+    return getFrameAtLocked(t);
+}
+
+FrameItem FrameList::getFrameAt(const nsecs_t& t, int index) {
+    if (index == 0) {
+        ILOG(1, "FrameList received an invalid index");
+        return FrameItem();
+    }
+    if (mFrames.empty()) {
+        ILOG(1, "FrameList is empty");
+        return FrameItem();
+    }
+    // An oldest frame that is not valid yet counts as index 0, so that negative indices find
+    // nothing until it is ready.
+    const int64_t oldestIndex = getIndexForFrame(t, mFrames.front());
+    int64_t position = int64_t{index} - oldestIndex;
+    if (index > 0 && oldestIndex < 0) position -= 1;  // the gap at index 0
+    if (position < 0 || position >= static_cast<int64_t>(mFrames.size())) return FrameItem();
+    return mFrames[static_cast<size_t>(position)];
+}
+
+FrameItem FrameList::getFrameBefore(const nsecs_t& t) {
+    std::lock_guard lock(mMutex);
+    return getFrameAt(t, -1);
+}
+
+FrameItem FrameList::getFrameAfter(const nsecs_t& t) {
+    std::lock_guard lock(mMutex);
+    return getFrameAt(t, 1);
+}
+
+bool FrameList::isLockedLocked(nsecs_t id) const {
+    return std::binary_search(mLocks.begin(), mLocks.end(), id);
+}
+
+void FrameList::lockLocked(const FrameItem& frame) {
+    auto position = std::lower_bound(mLocks.begin(), mLocks.end(), frame.mID);
+    if (position == mLocks.end() || *position != frame.mID) mLocks.insert(position, frame.mID);
+}
+
+FrameItem FrameList::getFrameBeforeAndLock(const nsecs_t& t) {
+    std::lock_guard lock(mMutex);
+    FrameItem frame = getFrameAt(t, -1);
+    if (mLockingEnabled && frame.isValid()) lockLocked(frame);
+    return frame;
+}
+
+FrameItem FrameList::getFrameAfterAndLock(const nsecs_t& t) {
+    std::lock_guard lock(mMutex);
+    FrameItem frame = getFrameAt(t, 1);
+    if (mLockingEnabled && frame.isValid()) lockLocked(frame);
+    return frame;
+}
+
+FrameItem FrameList::getFrameAtAndLock(const nsecs_t& t) {
+    std::lock_guard lock(mMutex);
+    auto found = std::find_if(mFrames.begin(), mFrames.end(),
+                              [&](const FrameItem& queued) { return queued.mID == t; });
+    if (found == mFrames.end()) return FrameItem();
+    lockLocked(*found);
+    return *found;
+}
+
+FrameItem FrameList::getLatestValidFrameAndLock() {
+    std::lock_guard lock(mMutex);
+    for (size_t i = mFrames.size(); i-- > 0;) {
+        if (mFrames[i].isValid()) {
+            lockLocked(mFrames[i]);
+            return mFrames[i];
+        }
+    }
+    return FrameItem();
+}
+
+FrameItem FrameList::getLatestAcquiredFrameAndLock() {
+    std::lock_guard lock(mMutex);
+    for (size_t i = mFrames.size(); i-- > 0;) {
+        if (mFrames[i].mAcquired) {
+            lockLocked(mFrames[i]);
+            return mFrames[i];
+        }
+    }
+    return FrameItem();
+}
+
+FrameItem FrameList::getNewestFrameAndLock() {
+    std::lock_guard lock(mMutex);
+    if (mFrames.empty()) return FrameItem();
+    lockLocked(mFrames.back());
+    return mFrames.back();
+}
+
+void FrameList::unlock(const nsecs_t& t) {
+    {
+        std::lock_guard lock(mMutex);
+        auto position = std::lower_bound(mLocks.begin(), mLocks.end(), t);
+        if (position != mLocks.end() && *position == t) {
+            mLocks.erase(position);
+            ILOG(2, "FrameList::unlock unlocking %lu", t);
+        } else {
+            ILOG(1, "FrameList attempted to unlock non-locked frame %lu", t);
+        }
+    }
+    mUnlockCondition.notify_all();
+}
+
+void FrameList::unlockAll() {
+    {
+        std::lock_guard lock(mMutex);
+        mLocks.clear();
+    }
+    mUnlockCondition.notify_all();
+}
+
+void FrameList::killLocks() {
+    {
+        std::lock_guard lock(mMutex);
+        mLockingEnabled = false;
+    }
+    {
+        std::lock_guard lock(mMutex);
+        mLocks.clear();
+    }
+    mUnlockCondition.notify_all();
+}
+
+bool FrameList::isOldestFrameUnused(const nsecs_t& t) {
+    std::lock_guard lock(mMutex);
+    return isOldestFrameUnusedLocked(t);
+}
+
+bool FrameList::isOldestFrameUnusedLocked(const nsecs_t& t) {
+    return getFrameAt(t, -2).isValid();
+}
+
+void FrameList::waitWhileLockedLocked(nsecs_t id, std::unique_lock<std::mutex>& lock) {
+    while (isLockedLocked(id) && hasFrameAtLocked(id)) {
+        mUnlockCondition.wait(lock);
+    }
+}
+
+FrameItem FrameList::clearOldestFrameLockedLocking(std::unique_lock<std::mutex>& lock) {
+    if (mFrames.empty()) return FrameItem();
+    FrameItem oldest = mFrames.front();
+    waitWhileLockedLocked(oldest.mID, lock);
+    // Whatever is at the front now goes; another removal may have emptied the list meanwhile.
+    if (!mFrames.empty()) mFrames.pop_front();
+    return oldest;
+}
+
+std::vector<FrameItem> FrameList::clearOldestFrameLocking() {
+    Interpolation::ScopedTrace trace("clearOldestFrameLocking");
+    UniqueLock<std::mutex> lock(mMutex);
+    FrameItem removed = clearOldestFrameLockedLocking(lock);
+    if (!removed.isValid()) return {};
+    return {std::move(removed)};
+}
+
+std::vector<FrameItem> FrameList::clearOldestFrameIfUnusedLocking(const nsecs_t& t) {
+    Interpolation::ScopedTrace trace("clearOldestFrameIfUnusedLocking");
+    UniqueLock<std::mutex> lock(mMutex);
+    if (!isOldestFrameUnusedLocked(t)) return {};
+    FrameItem removed = clearOldestFrameLockedLocking(lock);
+    if (!removed.isValid()) return {};
+    return {std::move(removed)};
+}
+
+FrameItem FrameList::clearFrameAtLocking(const nsecs_t& t) {
+    Interpolation::ScopedTrace trace("clearFrameAtLocking");
+    FrameItem frame = getFrameAt(t);
+    std::unique_lock lock(mMutex);
+    waitWhileLockedLocked(frame.mID, lock);
+    if (hasFrameAtLocked(frame.mID)) {
+        auto found = std::find_if(mFrames.begin(), mFrames.end(), [&](const FrameItem& queued) {
+            return queued.mTimestamp == frame.mTimestamp;
+        });
+        if (found != mFrames.end()) mFrames.erase(found);
+    }
+    return frame;
+}
+
+std::vector<FrameItem> FrameList::clearEveryFrame() {
+    std::lock_guard lock(mMutex);
+    std::vector<FrameItem> removed;
+    removed.reserve(mFrames.size());
+    while (!mFrames.empty())
+        removed.push_back(mFrames.pop_front());
+    return removed;
+}
+
+std::vector<FrameItem> FrameList::clearEveryFrameButTheNewestOne() {
+    std::lock_guard lock(mMutex);
+    // Keep the newest acquired frame and everything newer; with no acquired frame this counts one
+    // more than the queue holds, so nothing goes.
+    size_t keep = 1;
+    for (size_t i = mFrames.size(); i-- > 0;) {
+        if (mFrames[i].mAcquired) break;
+        keep++;
+    }
+    ILOG(2, "FrameList::clearEveryFrameButTheNewestOne will leave %d frames in the queue.",
+         static_cast<int>(keep));
+    std::vector<FrameItem> removed;
+    while (mFrames.size() > keep)
+        removed.push_back(mFrames.pop_front());
+    return removed;
+}
+
+int FrameList::getPresentQueueIndex(const nsecs_t& t) const {
+    int present = 0;
+    for (const FrameItem& frame : mFrames) {
+        if (frame.mID > t) break;
+        present++;
+    }
+    return present;
+}
+
+int FrameList::getFrameIndexBeforeLocked(const nsecs_t& t) const {
+    if (mFrames.empty()) return -1;
+    return getPresentQueueIndex(t) - 1;
+}
+
+int FrameList::getIndexForFrame(const nsecs_t& t, const FrameItem& frame) const {
+    if (!frame.isValid()) {
+        ILOG(1, "FrameList passed an invalid FrameItem");
+        return 0;
+    }
+    for (size_t p = 0; p < mFrames.size(); p++) {
+        if (mFrames[p].mTimestamp == frame.mTimestamp) {
+            const int index = static_cast<int>(p) - getPresentQueueIndex(t);
+            return t < frame.mID ? index + 1 : index;
+        }
+    }
+    ILOG(1, "FrameList passed a Frame not in the list");
+    return 0;
+}
+
+void FrameList::dump(String8& out, const char* prefix) const {
+    std::lock_guard lock(mMutex);
+    dumpLocked(out, prefix);
+}
+
+void FrameList::dumpLocked(String8& out, const char* prefix) const {
+    for (size_t i = 0; i < mFrames.size(); i++) {
+        const FrameItem& frame = mFrames[i];
+        out.appendFormat("%sFrame %d -- ", prefix, static_cast<int>(i));
+        out.appendFormat(
+                "%smIndex %lu mTextureSlot=%d mTimestamp=%lu mID %lu mGraphicBuffer=%p "
+                "mAcquireFence=%p mAcquired=%s%s",
+                "", frame.mIndex, frame.mTextureSlot, frame.mTimestamp, frame.mID,
+                frame.mGraphicBuffer.get(), frame.mAcquireFence.get(),
+                frame.mAcquired ? "true" : "false", "");
+        out.appendFormat(" locked=%s\n", isLockedLocked(frame.mID) ? "true" : "false");
+    }
+}
+
+}  // namespace android

@@ -1,0 +1,66 @@
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <gui/InterpolationGui.h>
+#include <ui/Fence.h>
+#include <ui/FenceTime.h>
+#include <ui/GraphicBuffer.h>
+
+#include <cerrno>
+
+namespace android {
+namespace {
+
+bool isOpen(int fd) {
+    return fcntl(fd, F_GETFD) != -1 || errno != EBADF;
+}
+
+TEST(FenceTest, closesItsDescriptorWithTheLastReference) {
+    sp<Fence> fence = Fence::createPending();
+    const int fd = fence->get();
+    ASSERT_GE(fd, 0);
+    sp<Fence> second = fence;
+    fence.clear();
+    EXPECT_TRUE(isOpen(fd));
+    second.clear();
+    EXPECT_FALSE(isOpen(fd));
+}
+
+TEST(FenceTest, isPendingUntilSignalled) {
+    sp<Fence> fence = Fence::createPending();
+    auto fenceTime = std::make_shared<FenceTime>(fence);
+    EXPECT_EQ(TIMED_OUT, fence->wait(0));
+    EXPECT_EQ(Fence::SIGNAL_TIME_PENDING, fenceTime->getSignalTime());
+
+    fence->signal(1234);
+    EXPECT_EQ(NO_ERROR, fence->wait(0));
+    EXPECT_EQ(NO_ERROR, fence->wait(-1));
+    EXPECT_EQ(1234, fenceTime->getSignalTime());
+
+    fence->signal(5678);  // a fence signals once
+    EXPECT_EQ(1234, fence->getSignalTime());
+}
+
+TEST(FenceTest, noFenceCountsAsSignalledButHasNoTime) {
+    EXPECT_EQ(NO_ERROR, Fence::NO_FENCE->wait(0));
+    EXPECT_FALSE(Fence::NO_FENCE->isValid());
+    EXPECT_EQ(Fence::SIGNAL_TIME_INVALID, FenceTime(Fence::NO_FENCE).getSignalTime());
+    EXPECT_EQ(Fence::SIGNAL_TIME_INVALID, FenceTime(nullptr).getSignalTime());
+    EXPECT_EQ(Fence::SIGNAL_TIME_INVALID, FenceTime::NO_FENCE->getSignalTime());
+}
+
+TEST(GraphicBufferTest, givesCpuAccessToItsPixels) {
+    sp<GraphicBuffer> buffer = new GraphicBuffer(4, 2, PIXEL_FORMAT_RGBA_8888);
+    ASSERT_EQ(NO_ERROR, buffer->initCheck());
+    void* pixels = nullptr;
+    ASSERT_EQ(NO_ERROR, buffer->lock(GraphicBuffer::USAGE_SW_WRITE_OFTEN, &pixels));
+    static_cast<uint8_t*>(pixels)[4 * 2 * 4 - 1] = 0xff;  // last byte of the last pixel
+    EXPECT_EQ(NO_ERROR, buffer->unlock());
+    EXPECT_NE(buffer->getId(), sp<GraphicBuffer>(new GraphicBuffer(1, 1, 1))->getId());
+}
+
+TEST(InterpolationGuiTest, isOneInstance) {
+    EXPECT_EQ(&InterpolationGui::getInstance(), &InterpolationGui::getInstance());
+}
+
+}  // namespace
+}  // namespace android
