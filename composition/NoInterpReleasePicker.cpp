@@ -1,0 +1,14 @@
+#include "NoInterpReleasePicker.h"
+
+namespace android::Interpolation {
+
+NoInterpReleasePicker::NoInterpReleasePicker(sp<FrameList>& frameList, String8& name,
+                                             const uint32_t& uid)
+    : ReleasePicker(frameList, name, uid) {}
+
+ReleaseChoice NoInterpReleasePicker::tryRelease() {
+    beginTryReleaseLocked("NoInterpReleasePicker");
+    return chooseOldestFrameOnceDisplayedLocked();
+}
+
+}  // namespace android::Interpolation

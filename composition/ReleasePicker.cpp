@@ -1,0 +1,212 @@
+#include "ReleasePicker.h"
+
+#include <chrono>
+#include <thread>
+
+#include "FillInReleasePicker.h"
+#include "Log.h"
+#include "NoInterpReleasePicker.h"
+#include "RetimeReleasePicker.h"
+#include "UnlimitedReleasePicker.h"
+
+namespace android::Interpolation {
+
+namespace {
+
+using std::chrono::steady_clock;
+
+// now + waitTime, saturating at the largest time point rather than overflowing.
+steady_clock::time_point deadlineAfter(nsecs_t waitTime) {
+    const steady_clock::time_point now = steady_clock::now();
+    const std::chrono::nanoseconds wait(waitTime);
+    if (wait >= steady_clock::time_point::max() - now) return steady_clock::time_point::max();
+    return now + wait;
+}
+
+}  // namespace
+
+sp<ReleasePicker> ReleasePicker::newPickerFromMode(sp<FrameList>& frameList,
+                                                   sp<FrameTimingsAggregator>& /*timings*/,
+                                                   String8& name, unsigned int const& uid,
+                                                   InterpolationMode const& mode) {
+    switch (mode) {
+        case eFillInMode:
+            return new FillInReleasePicker(frameList, name, uid);
+        case eNoInterpMode:
+            return new NoInterpReleasePicker(frameList, name, uid);
+        case eUnlimitedMode:
+            return new UnlimitedReleasePicker(frameList, name, uid);
+        default:
+            return new RetimeReleasePicker(frameList, name, uid);
+    }
+}
+
+ReleasePicker::ReleasePicker(sp<FrameList>& frameList, String8& name, const uint32_t& uid)
+    : mFrameList(frameList), mName(name), mUid(uid) {}
+
+ReleasePicker::~ReleasePicker() {
+    ILOG(2, "Interpolation::ReleasePicker [%s] destructor", mName.c_str());
+    ILOG(2, "Interpolation::ReleasePicker: [%s] stop", mName.c_str());
+    stop();
+}
+
+void ReleasePicker::onFirstRef() {
+    std::lock_guard lock(mMutex);
+    ILOG(2, "Interpolation::ReleasePicker [%s] onFirstRef", mName.c_str());
+    EventDispatcher::subscribe(mUid, EVENT_FLAGS, this);
+}
+
+void ReleasePicker::onLastStrongRef(const void* /*id*/) {
+    EventDispatcher::unsubscribe(mUid, EVENT_FLAGS, this);
+    // Stopping here rather than in the destructor keeps a selection that is still running from
+    // calling into a subclass that is already destroyed.
+    stop();
+}
+
+void ReleasePicker::onEvent(const EventType& type, const nsecs_t& /*time*/, const EventData& data) {
+    ILOG(2, "ReleasePicker::onEvent %u received", type);
+    switch (type) {
+        case eCompositionEstimateEvent:
+            if (const auto* estimate = std::get_if<nsecs_t>(&data)) {
+                std::lock_guard lock(mInboxMutex);
+                mInbox.compositionEstimate = *estimate;
+                mInbox.hasCompositionEstimate = true;
+            } else {
+                ILOG(2,
+                     "ReleasePicker::onEvent eCompositionEstimateEvent received with no nsecs_t "
+                     "data");
+            }
+            break;
+        case eBufferComposedEvent:
+            if (const auto* state = std::get_if<RenderState>(&data)) {
+                std::lock_guard lock(mInboxMutex);
+                mInbox.composedState.items = state->items;  // reuses the inbox's storage
+                mInbox.hasComposedState = true;
+            } else {
+                ILOG(2,
+                     "ReleasePicker::onEvent eBufferComposedEvent received with no RenderState "
+                     "data");
+            }
+            break;
+        case eFrameReceivedEvent:
+            break;
+        default:
+            ILOG(1, "ReleasePicker::onEvent EventType %u not handled", type);
+            return;
+    }
+    wakeSelection();
+}
+
+void ReleasePicker::applyInboxLocked() {
+    std::lock_guard lock(mInboxMutex);
+    if (mInbox.hasCompositionEstimate) {
+        mUpcomingCompositionTime = mInbox.compositionEstimate;
+        mInbox.hasCompositionEstimate = false;
+    }
+    if (mInbox.hasComposedState) {
+        mLastComposedState.items.swap(mInbox.composedState.items);
+        mLatestFrameDisplayedTime = mLastComposedState.meanFrameID();
+        mInbox.hasComposedState = false;
+    }
+}
+
+void ReleasePicker::wakeSelection() {
+    mEventCount.fetch_add(1);
+    // A running step re-reads the count before it waits. Otherwise mMutex is only held for
+    // moments that never wait on the frame list or the bus, and taking it here orders this wake-up
+    // after the selection's wait has begun.
+    while (!mDeciding.load()) {
+        if (mMutex.try_lock()) {
+            applyInboxLocked();
+            mMutex.unlock();
+            break;
+        }
+        std::this_thread::yield();
+    }
+    mCondition.notify_all();
+}
+
+ReleaseChoice ReleasePicker::decideLocked(uint32_t& eventsSeen) {
+    mDeciding.store(true);
+    eventsSeen = mEventCount.load();
+    applyInboxLocked();
+    ReleaseChoice choice = tryRelease();
+    mDeciding.store(false);
+    return choice;
+}
+
+FrameItem ReleasePicker::selectFrameForRelease() {
+    ILOG(2, "Interpolation::ReleasePicker [%s] selectFrameForRelease", mName.c_str());
+    ReleaseChoice choice;
+    std::unique_lock lock(mMutex);
+    mActiveSelections++;
+    bool timedOut = false;
+    while (choice.action != ReleaseChoice::RELEASE) {
+        if (choice.frame.mID != 0) {
+            if (choice.frame.mAcquireFence != nullptr) choice.frame.mAcquireFence->wait(0);
+            if (choice.frame.mAcquired) break;
+        }
+        if (!mContinue) break;
+
+        uint32_t eventsSeen;
+        choice = decideLocked(eventsSeen);
+        const bool eventArrived = mEventCount.load() != eventsSeen;
+
+        if (choice.action == ReleaseChoice::WAIT_FOR_TIME) {
+            if (mContinue && choice.waitTime > 0 && !eventArrived) {
+                mCondition.wait_until(lock, deadlineAfter(choice.waitTime));
+            }
+        } else if (choice.action == ReleaseChoice::WAIT_FOR_EVENT) {
+            if (!mContinue || eventArrived) continue;
+            const steady_clock::time_point start = steady_clock::now();
+            const std::chrono::nanoseconds timeout(EVENT_WAIT_TIMEOUT);
+            mCondition.wait_for(lock, timeout);
+            if (steady_clock::now() - start < timeout) continue;
+            ILOG(2, "Interpolation::ReleasePicker timed out. mContinue = %d", mContinue);
+            timedOut = true;
+            break;
+        }
+    }
+    FrameItem frame = timedOut ? FrameItem() : choice.frame;
+    if (--mActiveSelections == 0) mSelectionsDone.notify_all();
+    return frame;
+}
+
+void ReleasePicker::stop() {
+    std::unique_lock lock(mMutex);
+    mContinue = false;
+    mCondition.notify_all();
+    mSelectionsDone.wait(lock, [this] { return mActiveSelections == 0; });
+}
+
+ReleaseChoice ReleasePicker::chooseOldestFrame() {
+    return {ReleaseChoice::RELEASE, mFrameList->getOldestFrame(), 0};
+}
+
+size_t ReleasePicker::beginTryReleaseLocked(const char* pickerName) {
+    const size_t size = mFrameList->size();
+    ILOG(2,
+         "Interpolation::%s: [%s] tryRelease: size %d upcomingDisplayTime %ld "
+         "mLatestFrameDisplayedTime %ld mUpcomingCompositionTime %ld",
+         pickerName, mName.c_str(), static_cast<int>(size), mUpcomingDisplayTime,
+         mLatestFrameDisplayedTime, mUpcomingCompositionTime);
+    return size;
+}
+
+ReleaseChoice ReleasePicker::chooseOldestFrameOnceDisplayedLocked() {
+    const nsecs_t displayed = mLatestFrameDisplayedTime;
+    if (displayed < mFrameList->getOldestFrame().mID) return {};
+    return chooseOldestFrame();
+}
+
+void ReleasePicker::setFrameListCapacity(size_t capacity) {
+    ILOG(2, "Interpolation::ReleasePicker [%s] setFrameListCapacity capacity %d", mName.c_str(),
+         static_cast<int>(capacity));
+    {
+        std::lock_guard lock(mMutex);
+        mFrameListCapacity = capacity;
+    }
+    mCondition.notify_all();
+}
+
+}  // namespace android::Interpolation

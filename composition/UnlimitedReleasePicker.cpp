@@ -1,0 +1,14 @@
+#include "UnlimitedReleasePicker.h"
+
+namespace android::Interpolation {
+
+UnlimitedReleasePicker::UnlimitedReleasePicker(sp<FrameList>& frameList, String8& name,
+                                               const uint32_t& uid)
+    : ReleasePicker(frameList, name, uid) {}
+
+ReleaseChoice UnlimitedReleasePicker::tryRelease() {
+    beginTryReleaseLocked("UnlimitedReleasePicker");
+    return chooseOldestFrameOnceDisplayedLocked();
+}
+
+}  // namespace android::Interpolation
