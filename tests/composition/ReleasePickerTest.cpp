@@ -7,6 +7,7 @@
 #include <limits>
 
 #include "FillInReleasePicker.h"
+#include "FrameTimings.h"
 #include "NoInterpReleasePicker.h"
 #include "RetimeReleasePicker.h"
 #include "UnlimitedReleasePicker.h"
@@ -48,7 +49,20 @@ protected:
     const uint32_t mUid = test::nextTestUid();
     String8 mName{"game#0"};
     sp<FrameList> mList = new FrameList(mUid);
+    sp<FrameTimingsAggregator> mTimings = new FrameTimingsAggregator(mUid);
 };
+
+TEST_F(ReleasePickerTest, factoryMapsModesToPolicies) {
+    auto pickerFor = [&](uint32_t mode) {
+        return ReleasePicker::newPickerFromMode(mList, mTimings, mName, mUid,
+                                                static_cast<InterpolationMode>(mode));
+    };
+    EXPECT_NE(nullptr, dynamic_cast<RetimeReleasePicker*>(pickerFor(0).get()));
+    EXPECT_NE(nullptr, dynamic_cast<FillInReleasePicker*>(pickerFor(1).get()));
+    EXPECT_NE(nullptr, dynamic_cast<NoInterpReleasePicker*>(pickerFor(2).get()));
+    EXPECT_NE(nullptr, dynamic_cast<UnlimitedReleasePicker*>(pickerFor(4).get()));
+    EXPECT_NE(nullptr, dynamic_cast<RetimeReleasePicker*>(pickerFor(6).get()));
+}
 
 TEST_F(ReleasePickerTest, displayedPolicyReleasesOnceTheComposedMeanReachesTheOldestFrame) {
     for (sp<ReleasePicker> picker :
