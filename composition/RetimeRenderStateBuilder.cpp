@@ -1,0 +1,105 @@
+#include "RetimeRenderStateBuilder.h"
+
+#include "Log.h"
+
+namespace android::Interpolation {
+
+namespace {
+
+// Where `t` lies between two display times, as a fraction; each difference is converted to
+// single precision before the division.
+float positionBetween(nsecs_t t, nsecs_t earlier, nsecs_t later) {
+    return static_cast<float>(t - earlier) / static_cast<float>(later - earlier);
+}
+
+}  // namespace
+
+RetimeRenderStateBuilder::RetimeRenderStateBuilder(String8& name, unsigned int const& uid,
+                                                   sp<FrameList>& frameList)
+    : RenderStateBuilder(name, uid, frameList) {}
+
+void RetimeRenderStateBuilder::onFirstRef() {
+    SettingsController::Observer::onFirstRef();
+}
+
+void RetimeRenderStateBuilder::onLastStrongRef(const void* id) {
+    SettingsController::Observer::onLastStrongRef(id);
+}
+
+void RetimeRenderStateBuilder::onSettingsChanged(const Settings& settings) {
+    ILOG(2, "Interpolation::RetimeRenderStateBuilder [%s] onSettingsChanged", mName.c_str());
+    std::lock_guard lock(mAlphaMutex);
+    if (&mAlphaFunction != &settings.alphaFunction) mAlphaFunction = settings.alphaFunction;
+}
+
+uint32_t RetimeRenderStateBuilder::getUID() const {
+    return mUid;
+}
+
+float RetimeRenderStateBuilder::getAlphaFromFunction(float x) {
+    std::lock_guard lock(mAlphaMutex);
+    return mAlphaFunction.getY(x);
+}
+
+RenderState RetimeRenderStateBuilder::getFramesFor(nsecs_t const& displayTime) {
+    const FrameItem before = mFrameList->getFrameBefore(displayTime);
+    const FrameItem after = mFrameList->getFrameAfter(displayTime);
+    RenderState state = newState();
+
+    if (before.isValid() && after.isValid()) {
+        const float alpha =
+                getAlphaFromFunction(positionBetween(displayTime, before.mID, after.mID));
+        ILOG(2,
+             "Interpolation::RetimeRenderStateBuilder [%s] getFramesFor: Retime interpolating "
+             "with alpha %f",
+             mName.c_str(), alpha);
+        if (alpha < 1.0f) pushFrame(state, mFrameList->getFrameBeforeAndLock(displayTime));
+        if (alpha > 0.0f) {
+            pushFrame(state, mFrameList->getFrameAfterAndLock(displayTime));
+        } else if (!state.items.empty() && state.items[0].frame.mID == mLastStateDisplayTime) {
+            // The earlier frame is already on screen: blend towards the next one rather than show
+            // it alone once more.
+            pushFrame(state, mFrameList->getFrameAfterAndLock(displayTime));
+        }
+        return announce(eBlendedCompositionEvent, std::move(state));
+    }
+
+    if (before.isValid()) {
+        const FrameItem shown = mFrameList->getFrameBeforeAndLock(displayTime);
+        if (!shown.isValid()) return RenderState();  // gone meanwhile
+        pushFrame(state, shown);
+        return announce(shown.mID == mLastStateDisplayTime ? eRepeatedCompositionEvent
+                                                           : eNewFrameCompositionEvent,
+                        std::move(state));
+    }
+
+    if (after.isValid()) {
+        pushFrame(state, mFrameList->getFrameAfterAndLock(displayTime));
+        return announce(eNewFrameCompositionEvent, std::move(state));
+    }
+
+    // Neither neighbour is usable: hold the last picture, or failing that the newest ready frame.
+    const FrameItem last = mFrameList->getFrameAtAndLock(mLastStateDisplayTime);
+    if (last.isValid()) {
+        pushFrame(state, last);
+    } else if (const FrameItem newest = mFrameList->getLatestValidFrameAndLock(); newest.isValid()) {
+        pushFrame(state, newest);
+    } else {
+        ILOG(1, "Interpolation::RetimeRenderStateBuilder [%s]: no valid frame!", mName.c_str());
+    }
+    return announce(eRepeatedCompositionEvent, std::move(state));
+}
+
+RenderState RetimeRenderStateBuilder::setupFramesFor(RenderState&& state,
+                                                     nsecs_t const& displayTime) {
+    state = setupOpaqueFrame(std::move(state));
+    if (state.items.size() > 1) {
+        RenderItem& later = state.items[1];
+        later.alpha = getAlphaFromFunction(
+                positionBetween(displayTime, state.items[0].frame.mID, later.frame.mID));
+        later.blend = 1;
+    }
+    return std::move(state);
+}
+
+}  // namespace android::Interpolation
