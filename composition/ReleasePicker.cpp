@@ -4,6 +4,7 @@
 #include <thread>
 
 #include "FillInReleasePicker.h"
+#include "JustInTimeReleasePicker.h"
 #include "Log.h"
 #include "NoInterpReleasePicker.h"
 #include "RetimeReleasePicker.h"
@@ -34,6 +35,8 @@ sp<ReleasePicker> ReleasePicker::newPickerFromMode(sp<FrameList>& frameList,
             return new FillInReleasePicker(frameList, name, uid);
         case eNoInterpMode:
             return new NoInterpReleasePicker(frameList, name, uid);
+        case eJustInTimeMode:
+            return new JustInTimeReleasePicker(frameList, name, uid);
         case eUnlimitedMode:
             return new UnlimitedReleasePicker(frameList, name, uid);
         default:

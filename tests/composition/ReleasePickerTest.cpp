@@ -8,6 +8,7 @@
 
 #include "FillInReleasePicker.h"
 #include "FrameTimings.h"
+#include "JustInTimeReleasePicker.h"
 #include "NoInterpReleasePicker.h"
 #include "RetimeReleasePicker.h"
 #include "UnlimitedReleasePicker.h"
@@ -60,6 +61,7 @@ TEST_F(ReleasePickerTest, factoryMapsModesToPolicies) {
     EXPECT_NE(nullptr, dynamic_cast<RetimeReleasePicker*>(pickerFor(0).get()));
     EXPECT_NE(nullptr, dynamic_cast<FillInReleasePicker*>(pickerFor(1).get()));
     EXPECT_NE(nullptr, dynamic_cast<NoInterpReleasePicker*>(pickerFor(2).get()));
+    EXPECT_NE(nullptr, dynamic_cast<JustInTimeReleasePicker*>(pickerFor(3).get()));
     EXPECT_NE(nullptr, dynamic_cast<UnlimitedReleasePicker*>(pickerFor(4).get()));
     EXPECT_NE(nullptr, dynamic_cast<RetimeReleasePicker*>(pickerFor(6).get()));
 }
