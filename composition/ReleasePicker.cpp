@@ -5,6 +5,7 @@
 
 #include "FillInReleasePicker.h"
 #include "Log.h"
+#include "MLLatencyReductionReleasePicker.h"
 #include "NoInterpReleasePicker.h"
 #include "RetimeReleasePicker.h"
 #include "UnlimitedReleasePicker.h"
@@ -26,7 +27,7 @@ steady_clock::time_point deadlineAfter(nsecs_t waitTime) {
 }  // namespace
 
 sp<ReleasePicker> ReleasePicker::newPickerFromMode(sp<FrameList>& frameList,
-                                                   sp<FrameTimingsAggregator>& /*timings*/,
+                                                   sp<FrameTimingsAggregator>& timings,
                                                    String8& name, unsigned int const& uid,
                                                    InterpolationMode const& mode) {
     switch (mode) {
@@ -36,6 +37,8 @@ sp<ReleasePicker> ReleasePicker::newPickerFromMode(sp<FrameList>& frameList,
             return new NoInterpReleasePicker(frameList, name, uid);
         case eUnlimitedMode:
             return new UnlimitedReleasePicker(frameList, name, uid);
+        case eLatencyReductionMode:
+            return new MLLatencyReductionReleasePicker(frameList, timings, name, uid);
         default:
             return new RetimeReleasePicker(frameList, name, uid);
     }
