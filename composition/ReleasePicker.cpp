@@ -6,6 +6,7 @@
 #include "FillInReleasePicker.h"
 #include "JustInTimeReleasePicker.h"
 #include "Log.h"
+#include "MLLatencyReductionReleasePicker.h"
 #include "NoInterpReleasePicker.h"
 #include "RetimeReleasePicker.h"
 #include "UnlimitedReleasePicker.h"
@@ -27,7 +28,7 @@ steady_clock::time_point deadlineAfter(nsecs_t waitTime) {
 }  // namespace
 
 sp<ReleasePicker> ReleasePicker::newPickerFromMode(sp<FrameList>& frameList,
-                                                   sp<FrameTimingsAggregator>& /*timings*/,
+                                                   sp<FrameTimingsAggregator>& timings,
                                                    String8& name, unsigned int const& uid,
                                                    InterpolationMode const& mode) {
     switch (mode) {
@@ -39,6 +40,8 @@ sp<ReleasePicker> ReleasePicker::newPickerFromMode(sp<FrameList>& frameList,
             return new JustInTimeReleasePicker(frameList, name, uid);
         case eUnlimitedMode:
             return new UnlimitedReleasePicker(frameList, name, uid);
+        case eLatencyReductionMode:
+            return new MLLatencyReductionReleasePicker(frameList, timings, name, uid);
         default:
             return new RetimeReleasePicker(frameList, name, uid);
     }
