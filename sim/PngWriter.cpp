@@ -85,7 +85,7 @@ private:
         if (y < recording.scanlines.size()) {
             const std::vector<uint8_t>& scanline = recording.scanlines[y];
             copied = std::min<size_t>(scanline.size() / 3, recording.scanlineWidth);
-            memcpy(out, scanline.data(), copied * 3);
+            if (copied > 0) memcpy(out, scanline.data(), copied * 3);
             out += copied * 3;
         }
         return fill(out, PAD, recording.scanlineWidth - copied);

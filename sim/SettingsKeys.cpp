@@ -47,7 +47,7 @@ std::string checkInt(const SettingKey& key, int64_t value, const std::string& go
 }
 
 std::string checkFloat(const SettingKey& key, double value, const std::string& got, float& out) {
-    if (value > FLT_MAX || value < -FLT_MAX) {
+    if (!std::isfinite(value) || value > FLT_MAX || value < -FLT_MAX) {
         return std::string(key.name) + " is out of range (got " + got + ")";
     }
     out = static_cast<float>(value);

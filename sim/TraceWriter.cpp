@@ -28,6 +28,7 @@ public:
     void write(const std::string& title);
 
 private:
+    // Times passed here are >= 0, as is the origin, so the difference cannot overflow.
     double us(nsecs_t time) const { return (time - mOrigin) / 1e3; }
     Json::Value& event(const char* ph, const std::string& name, const char* cat, int tid,
                        nsecs_t time);
@@ -111,13 +112,13 @@ void ProcessTrace::writeRefreshes() {
         vsync["args"]["index"] = Json::UInt64(refresh.index);
 
         // Until the next vsync; the last refresh lasts one period.
-        nsecs_t until = refresh.vsyncTime + mRecording.refreshPeriod;
+        double durationUs = mRecording.refreshPeriod / 1e3;
         if (i + 1 < refreshes.size() && refreshes[i + 1].vsyncTime >= 0) {
-            until = refreshes[i + 1].vsyncTime;
+            durationUs = us(refreshes[i + 1].vsyncTime) - us(refresh.vsyncTime);
         }
         Json::Value& state =
                 event("X", stateName(refresh), "composition", COMPOSITION_TID, refresh.vsyncTime);
-        state["dur"] = std::max(0.0, us(until) - us(refresh.vsyncTime));
+        state["dur"] = std::max(0.0, durationUs);
         Json::Value& args = state["args"];
         args["index"] = Json::UInt64(refresh.index);
         args["kind"] = refresh.kind;
@@ -181,6 +182,7 @@ void ProcessTrace::writeFrame(const FrameRecord& frame) {
 
 void ProcessTrace::writeDelays() {
     for (const DelayChange& change : mRecording.delayChanges) {
+        if (change.time < 0) continue;
         event("C", "display delay", "delay", DISPLAY_TID, change.time)["args"]["ms"] =
                 change.delay / 1e6;
     }
