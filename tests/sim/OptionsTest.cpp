@@ -18,60 +18,25 @@ TEST(OptionsTest, takesValuesAsTheNextArgumentOrAfterAnEqualsSign) {
     auto none = parse({});
     ASSERT_TRUE(none.ok());
     EXPECT_EQ(30, none.value.fps);
-    EXPECT_EQ(60, none.value.hz);
-    EXPECT_EQ(3u, none.value.slots);
     EXPECT_EQ("sim-out", none.value.outDir);
     EXPECT_TRUE(none.value.reference);
 
-    auto all = parse({"--fps",
-                      "59.94",
-                      "--jitter-ms=0",
-                      "--render-ms",
-                      "12.5",
-                      "--hz=120",
-                      "--mode",
-                      "5",
-                      "--slots",
-                      "64",
-                      "--duration",
-                      "0.5",
-                      "--out",
-                      "o",
-                      "--capture=c.csv",
-                      "--settings",
-                      "s.json",
-                      "--set",
-                      "delayMs=40",
-                      "--set=mode=2",
-                      "--seed",
-                      "18446744073709551615",
-                      "--width",
-                      "16",
-                      "--no-reference",
-                      "--quiet"});
-    ASSERT_TRUE(all.ok()) << all.error;
-    const Options& o = all.value;
+    auto some = parse({"--fps", "59.94", "--hz=120", "--slots", "64", "--capture=c.csv", "--set",
+                       "delayMs=40", "--set=mode=2", "--seed", "18446744073709551615",
+                       "--no-reference"});
+    ASSERT_TRUE(some.ok()) << some.error;
+    const Options& o = some.value;
     EXPECT_EQ(59.94, o.fps);
-    EXPECT_EQ(0, o.jitterMs);
-    EXPECT_EQ(12.5, o.renderMs);
     EXPECT_EQ(120, o.hz);
-    EXPECT_EQ(5u, o.mode);
     EXPECT_EQ(64u, o.slots);
-    EXPECT_EQ(0.5, o.durationSec);
-    EXPECT_EQ("o", o.outDir);
     EXPECT_EQ("c.csv", o.capturePath);
-    EXPECT_EQ("s.json", o.settingsPath);
     ASSERT_EQ(2u, o.overrides.size());
-    EXPECT_EQ(1, o.overrides[0].id);
     EXPECT_EQ(7, o.overrides[1].id);
     EXPECT_EQ(UINT64_MAX, o.seed);
-    EXPECT_EQ(16u, o.width);
     EXPECT_FALSE(o.reference);
-    EXPECT_TRUE(o.quiet);
 
     auto help = parse({"--fps", "5", "--help", "--hz", "0"});
-    ASSERT_TRUE(help.ok());
-    EXPECT_TRUE(help.value.help);
+    EXPECT_TRUE(help.ok() && help.value.help);
 }
 
 TEST(OptionsTest, refusesImpossibleValuesWithOneLineEach) {
@@ -106,7 +71,7 @@ TEST(OptionsTest, settingsFromTheFileComeBeforeTheOverrides) {
     const auto dir = std::filesystem::temp_directory_path() / "verolux-options-test";
     std::filesystem::create_directories(dir);
     const std::string path = (dir / "s.json").string();
-    std::ofstream(path) << R"({"delayMs": 40, "smartDelay": true})";
+    std::ofstream(path) << R"({"delayMs": 40, "rfps": 90})";
 
     auto options = parse({"--set", "delayMs=20", "--settings", path.c_str()});
     ASSERT_TRUE(options.ok()) << options.error;
@@ -115,12 +80,10 @@ TEST(OptionsTest, settingsFromTheFileComeBeforeTheOverrides) {
     ASSERT_TRUE(settings.ok()) << settings.error;
 
     std::vector<std::pair<int32_t, int32_t>> entries;
-    for (const host::SettingValue& v : settings.value) {
-        entries.emplace_back(v.id, std::holds_alternative<bool>(v.value)
-                                           ? std::get<bool>(v.value)
-                                           : std::get<int32_t>(v.value));
-    }
-    EXPECT_THAT(entries, testing::ElementsAre(std::pair(1, 40), std::pair(2, 1), std::pair(1, 20)));
+    for (const host::SettingValue& v : settings.value)
+        entries.emplace_back(v.id, std::get<int32_t>(v.value));
+    EXPECT_THAT(entries,
+                testing::ElementsAre(std::pair(1, 40), std::pair(18, 90), std::pair(1, 20)));
 }
 
 }  // namespace

@@ -11,84 +11,76 @@ namespace {
 
 using Pixel = std::array<int, 3>;
 
-// Row y of width 16: pixel x is (10 * y, x, base).
+// 16 pixels wide; row y, pixel x is (10 * y, x, base).
 Recording recording(std::vector<uint32_t> kinds, uint8_t base) {
     Recording r;
     r.scanlineWidth = 16;
     for (size_t y = 0; y < kinds.size(); y++) {
-        RefreshRecord refresh;
-        refresh.kind = kinds[y];
-        r.refreshes.push_back(refresh);
-        std::vector<uint8_t> line;
+        r.refreshes.emplace_back().kind = kinds[y];
+        auto& line = r.scanlines.emplace_back();
         for (uint8_t x = 0; x < 16; x++)
             line.insert(line.end(), {static_cast<uint8_t>(10 * y), x, base});
-        r.scanlines.push_back(line);
     }
     return r;
 }
 
-class PngWriterTest : public testing::Test {
-protected:
-    void SetUp() override { std::filesystem::create_directories(mDir); }
-    void TearDown() override { std::filesystem::remove_all(mDir); }
+// The file decoded by libpng: width, height and RGB pixels.
+struct Decoded {
+    uint32_t width = 0;
+    uint32_t height = 0;
+    std::vector<uint8_t> rgb;
 
-    // Decodes the file with libpng into mWidth x mHeight RGB pixels.
-    void decode() {
-        png_image image{};
-        image.version = PNG_IMAGE_VERSION;
-        ASSERT_TRUE(png_image_begin_read_from_file(&image, mPath.c_str())) << image.message;
-        image.format = PNG_FORMAT_RGB;
-        mWidth = image.width;
-        mHeight = image.height;
-        mPixels.resize(PNG_IMAGE_SIZE(image));
-        ASSERT_TRUE(png_image_finish_read(&image, nullptr, mPixels.data(), 0, nullptr));
-    }
     Pixel at(uint32_t x, uint32_t y) const {
-        const uint8_t* p = &mPixels[(y * mWidth + x) * 3];
+        const uint8_t* p = &rgb[(y * width + x) * 3];
         return {p[0], p[1], p[2]};
     }
-
-    const std::filesystem::path mDir = std::filesystem::temp_directory_path() / "verolux-png-test";
-    const std::string mPath = (mDir / "space-time.png").string();
-    uint32_t mWidth = 0;
-    uint32_t mHeight = 0;
-    std::vector<uint8_t> mPixels;
 };
 
-TEST_F(PngWriterTest, putsTheRunAndTheReferenceSideBySideWithKindMargins) {
-    const Recording run = recording({64, 8, 16}, 200);
-    const Recording reference = recording({64, 0}, 100);
-    ASSERT_TRUE(writeSpaceTimePng(mPath, run, &reference).ok());
-    decode();
-
-    // 4 margin + 16 run + 4 separator + 4 margin + 16 reference; rows up to the longer run.
-    EXPECT_EQ(44u, mWidth);
-    EXPECT_EQ(3u, mHeight);
-    EXPECT_EQ((Pixel{40, 200, 70}), at(0, 0));     // new picture
-    EXPECT_EQ((Pixel{40, 110, 255}), at(3, 1));    // blend
-    EXPECT_EQ((Pixel{230, 40, 40}), at(0, 2));     // repeat
-    EXPECT_EQ((Pixel{10, 5, 200}), at(4 + 5, 1));  // the run's scanline
-    EXPECT_EQ((Pixel{255, 255, 255}), at(20, 0));  // separator
-    EXPECT_EQ((Pixel{0, 0, 0}), at(24, 1));        // no state
-    EXPECT_EQ((Pixel{10, 15, 100}), at(28 + 15, 1));
-    EXPECT_EQ((Pixel{128, 128, 128}), at(24, 2));  // the reference has ended
-    EXPECT_EQ((Pixel{128, 128, 128}), at(43, 2));
+Decoded decode(const std::string& path) {
+    png_image image{};
+    image.version = PNG_IMAGE_VERSION;
+    Decoded decoded;
+    if (!png_image_begin_read_from_file(&image, path.c_str())) return decoded;
+    image.format = PNG_FORMAT_RGB;
+    decoded.rgb.resize(PNG_IMAGE_SIZE(image));
+    if (png_image_finish_read(&image, nullptr, decoded.rgb.data(), 0, nullptr)) {
+        decoded.width = image.width;
+        decoded.height = image.height;
+    }
+    return decoded;
 }
 
-TEST_F(PngWriterTest, drawsTheRunAloneAndPadsShortScanlines) {
-    Recording run = recording({64, 64}, 50);
-    run.scanlines[1].resize(3 * 10);
-    ASSERT_TRUE(writeSpaceTimePng(mPath, run).ok());
-    decode();
-    EXPECT_EQ(20u, mWidth);
-    EXPECT_EQ(2u, mHeight);
-    EXPECT_EQ((Pixel{10, 9, 50}), at(4 + 9, 1));
-    EXPECT_EQ((Pixel{128, 128, 128}), at(4 + 10, 1));
+TEST(PngWriterTest, putsTheRunAndTheReferenceSideBySideWithKindMarginsAndPadding) {
+    const auto dir = std::filesystem::temp_directory_path() / "verolux-png-test";
+    std::filesystem::create_directories(dir);
+    const std::string both = (dir / "both.png").string();
+    const std::string alone = (dir / "alone.png").string();
+    const Recording run = recording({64, 8, 16}, 200);
+    Recording reference = recording({64, 0}, 100);
+    reference.scanlines[1].resize(3 * 10);
+    ASSERT_TRUE(writeSpaceTimePng(both, run, &reference).ok());
+    ASSERT_TRUE(writeSpaceTimePng(alone, run).ok());
+    const Decoded image = decode(both);
+    const Decoded runOnly = decode(alone);
+    std::filesystem::remove_all(dir);
 
-    EXPECT_EQ("verolux-sim: cannot draw " + mPath + ": no refreshes recorded",
-              writeSpaceTimePng(mPath, Recording()).error);
-    EXPECT_EQ("verolux-sim: cannot write /nonexistent/p.png: No such file or directory",
-              writeSpaceTimePng("/nonexistent/p.png", run).error);
+    // 4 margin + 16 run + 4 separator + 4 margin + 16 reference; rows up to the longer run.
+    ASSERT_EQ(44u, image.width);
+    ASSERT_EQ(3u, image.height);
+    EXPECT_EQ((Pixel{40, 200, 70}), image.at(0, 0));     // new picture
+    EXPECT_EQ((Pixel{40, 110, 255}), image.at(3, 1));    // blend
+    EXPECT_EQ((Pixel{230, 40, 40}), image.at(0, 2));     // repeat
+    EXPECT_EQ((Pixel{10, 5, 200}), image.at(4 + 5, 1));  // the run's scanline
+    EXPECT_EQ((Pixel{255, 255, 255}), image.at(20, 0));  // separator
+    EXPECT_EQ((Pixel{0, 0, 0}), image.at(24, 1));        // no state
+    EXPECT_EQ((Pixel{10, 9, 100}), image.at(28 + 9, 1));
+    EXPECT_EQ((Pixel{128, 128, 128}), image.at(28 + 10, 1));  // past a short scanline
+    EXPECT_EQ((Pixel{128, 128, 128}), image.at(24, 2));       // past the reference's end
+
+    EXPECT_EQ(20u, runOnly.width);
+    EXPECT_EQ(3u, runOnly.height);
+    EXPECT_EQ("verolux-sim: cannot draw x.png: no refreshes recorded",
+              writeSpaceTimePng("x.png", Recording()).error);
 }
 
 }  // namespace

@@ -1,3 +1,4 @@
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include "sim/Summary.h"
@@ -87,12 +88,9 @@ TEST(SummaryTest, printsTheRunAndTheReferenceSideBySide) {
             "library CPU per refresh, mean     40.0 us                    0.0 us\n"
             "library CPU per refresh, p99      100.0 us                   0.0 us\n",
             formatSummary(run, &ref));
-
-    const std::string alone = formatSummary(run);
-    EXPECT_EQ(
-            "                                  run (mode 0)\n"
-            "run length                        1.000 s\n",
-            alone.substr(0, alone.find('\n', alone.find('\n') + 1) + 1));
+    EXPECT_THAT(formatSummary(run),
+                testing::StartsWith("                                  run (mode 0)\n"
+                                    "run length                        1.000 s\n"));
 }
 
 }  // namespace

@@ -25,29 +25,13 @@ Recording smallRun(uint32_t mode) {
     r.refreshPeriod = 16'500'000;
     r.startTime = START;
     r.endTime = START + 50 * MS;
-    FrameRecord one;
-    one.number = 1;
-    one.slot = 2;
-    one.queueTime = START + 1 * MS;
-    one.renderDoneTime = START + 5 * MS;
-    one.acquireTime = START + 6 * MS;
-    one.firstDisplayTime = START + 10 * MS;
-    one.releaseTime = START + 40 * MS;
-    FrameRecord two;
-    two.number = 2;
-    two.queueTime = START + 20 * MS;
-    r.frames = {one, two};
-    RefreshRecord first;
-    first.index = 0;
-    first.vsyncTime = START + 10 * MS;
-    first.kind = 64;
-    first.items = {{1, 1.0f, 0, 1.0f}};
-    RefreshRecord second = first;
-    second.index = 1;
-    second.vsyncTime = START + 26'500'000;
-    second.kind = 8;
-    second.items = {{1, 1.0f, 0, 0.75f}, {2, 0.25f, 0, 0.25f}};
-    r.refreshes = {first, second};
+    // number, slot, content, dequeue, queue, render done, acquire, release, first display
+    r.frames = {{1, 2, -1, -1, START + 1 * MS, START + 5 * MS, START + 6 * MS, START + 40 * MS,
+                 START + 10 * MS},
+                {2, -1, -1, -1, START + 20 * MS}};
+    // index, vsync, display time, kind, items
+    r.refreshes = {{0, START + 10 * MS, -1, 64, {{1, 1.0f, 0, 1.0f}}},
+                   {1, START + 26'500'000, -1, 8, {{1, 1.0f, 0, 0.75f}, {2, 0.25f, 0, 0.25f}}}};
     r.delayChanges = {{START + 2 * MS, 64 * MS}};
     return r;
 }
