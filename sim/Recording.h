@@ -65,4 +65,9 @@ struct Recording {
     std::vector<std::vector<uint8_t>> scanlines;
 };
 
+// The time the output files count from: the start of the run, or 0 when it was not recorded.
+inline nsecs_t timeOrigin(const Recording& recording) {
+    return recording.startTime >= 0 ? recording.startTime : 0;
+}
+
 }  // namespace verolux::sim

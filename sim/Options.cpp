@@ -1,0 +1,231 @@
+#include "sim/Options.h"
+
+#include <charconv>
+#include <cstdio>
+
+#include "sim/SettingsKeys.h"
+#include "sim/TextNumbers.h"
+
+namespace verolux::sim {
+
+namespace {
+
+// Real-valued options with their accepted range. The upper bounds keep every derived duration in
+// nanoseconds far from overflow and a run's recording within memory.
+struct RealOption {
+    std::string_view name;
+    double Options::*field;
+    double min;
+    bool minIncluded;
+    double max;
+    std::string_view rule;
+};
+
+const RealOption REAL_OPTIONS[] = {
+        {"--fps", &Options::fps, 0, false, 1000, "must be greater than 0 and at most 1000"},
+        {"--hz", &Options::hz, 1, true, 1000, "must be between 1 and 1000"},
+        {"--jitter-ms", &Options::jitterMs, 0, true, 1000, "must be between 0 and 1000"},
+        {"--render-ms", &Options::renderMs, 0, true, 1000, "must be between 0 and 1000"},
+        {"--duration", &Options::durationSec, 0, false, 3600,
+         "must be greater than 0 and at most 3600 seconds"},
+};
+
+struct WholeOption {
+    std::string_view name;
+    uint32_t Options::*field;
+    int64_t min;
+    int64_t max;
+};
+
+const WholeOption WHOLE_OPTIONS[] = {
+        {"--mode", &Options::mode, 0, 5},
+        {"--slots", &Options::slots, 2, 64},
+        {"--width", &Options::width, 16, 4096},
+};
+
+struct TextOption {
+    std::string_view name;
+    std::string Options::*field;
+};
+
+const TextOption TEXT_OPTIONS[] = {
+        {"--out", &Options::outDir},
+        {"--capture", &Options::capturePath},
+        {"--settings", &Options::settingsPath},
+};
+
+std::string formatNumber(double value) {
+    char text[32];
+    snprintf(text, sizeof(text), "%g", value);
+    return text;
+}
+
+std::string tryHelp(std::string_view message) {
+    return errorLine(std::string(message) + " (try --help)");
+}
+
+// Each apply returns the error line, or an empty string when the value was taken.
+std::string applyReal(const RealOption& option, std::string_view text, Options& options) {
+    const auto value = parseNumber(text);
+    if (!value) {
+        return errorLine(std::string(option.name) + " expects a number (got " + quoted(text) + ")");
+    }
+    const bool aboveMin = option.minIncluded ? *value >= option.min : *value > option.min;
+    if (!aboveMin || *value > option.max) {
+        return errorLine(std::string(option.name) + " " + std::string(option.rule) + " (got " +
+                         formatNumber(*value) + ")");
+    }
+    options.*option.field = *value;
+    return {};
+}
+
+std::string applyWhole(const WholeOption& option, std::string_view text, Options& options) {
+    const auto value = parseInteger(text);
+    if (!value) {
+        return errorLine(std::string(option.name) + " expects a whole number (got " + quoted(text) +
+                         ")");
+    }
+    if (*value < option.min || *value > option.max) {
+        return errorLine(std::string(option.name) + " must be between " +
+                         std::to_string(option.min) + " and " + std::to_string(option.max) +
+                         " (got " + std::to_string(*value) + ")");
+    }
+    options.*option.field = static_cast<uint32_t>(*value);
+    return {};
+}
+
+std::string applySeed(std::string_view text, Options& options) {
+    const char* end = text.data() + text.size();
+    const auto [ptr, ec] = std::from_chars(text.data(), end, options.seed);
+    if (text.empty() || ec != std::errc() || ptr != end) {
+        return errorLine("--seed expects a whole number from 0 to 2^64-1 (got " + quoted(text) +
+                         ")");
+    }
+    return {};
+}
+
+// Applies an option that takes a value; false when the name is no such option.
+bool applyValueOption(std::string_view name, std::string_view text, Options& options,
+                      std::string& error) {
+    for (const RealOption& option : REAL_OPTIONS) {
+        if (option.name == name) {
+            error = applyReal(option, text, options);
+            return true;
+        }
+    }
+    for (const WholeOption& option : WHOLE_OPTIONS) {
+        if (option.name == name) {
+            error = applyWhole(option, text, options);
+            return true;
+        }
+    }
+    for (const TextOption& option : TEXT_OPTIONS) {
+        if (option.name == name) {
+            if (text.empty()) error = errorLine(std::string(name) + " needs a non-empty value");
+            options.*option.field = text;
+            return true;
+        }
+    }
+    if (name == "--seed") {
+        error = applySeed(text, options);
+        return true;
+    }
+    if (name == "--set") {
+        auto value = parseSettingAssignment(text);
+        error = value.error;
+        if (value.ok()) options.overrides.push_back(std::move(value.value));
+        return true;
+    }
+    return false;
+}
+
+// Applies an option that takes no value; false when the name is no such option.
+bool applyFlag(std::string_view name, Options& options) {
+    if (name == "--help" || name == "-h") {
+        options.help = true;
+    } else if (name == "--no-reference") {
+        options.reference = false;
+    } else if (name == "--quiet") {
+        options.quiet = true;
+    } else {
+        return false;
+    }
+    return true;
+}
+
+}  // namespace
+
+Result<Options> parseOptions(int argc, const char* const* argv) {
+    using R = Result<Options>;
+    R result;
+    Options& options = result.value;
+    for (int i = 1; i < argc; i++) {
+        const std::string_view arg = argv[i] != nullptr ? argv[i] : "";
+        std::string_view name = arg;
+        std::string_view text;
+        const size_t equals = arg.find('=');
+        const bool inlineValue = arg.rfind("--", 0) == 0 && equals != std::string_view::npos;
+        if (inlineValue) {
+            name = arg.substr(0, equals);
+            text = arg.substr(equals + 1);
+        }
+        if (applyFlag(name, options)) {
+            if (inlineValue) return R::failure(errorLine(std::string(name) + " takes no value"));
+            if (options.help) return result;
+            continue;
+        }
+        if (arg.empty() || arg[0] != '-') {
+            return R::failure(tryHelp("unexpected argument " + quoted(arg)));
+        }
+        if (!inlineValue && i + 1 < argc) text = argv[i + 1] != nullptr ? argv[i + 1] : "";
+        std::string error;
+        if (!applyValueOption(name, text, options, error)) {
+            return R::failure(tryHelp("unknown option " + quoted(name)));
+        }
+        if (!inlineValue) {
+            if (i + 1 >= argc) return R::failure(errorLine(std::string(name) + " needs a value"));
+            i++;
+        }
+        if (!error.empty()) return R::failure(error);
+    }
+    return result;
+}
+
+std::string usage() {
+    return R"(Usage: verolux-sim [options]
+Plays a simulated game and display in real time against the library and writes what happened.
+
+Game (ignored with --capture):
+  --fps F            frames per second the game queues (default 30, at most 1000)
+  --jitter-ms J      standard deviation of the queue times, ms (default 1)
+  --render-ms R      mean GPU time of a frame, ms (default 8)
+  --seed N           seed of the jitter and render times (default 1)
+  --capture FILE     replay a frame-time capture instead (see sim/captures/README.md)
+Display and library:
+  --hz H             display refresh rate (default 60, 1 to 1000)
+  --mode M           interpolation mode 0 to 5 (default 0)
+  --slots N          buffer-queue slots, 2 to 64 (default 3)
+  --settings FILE    settings as a JSON object of settings keys
+  --set KEY=VALUE    one setting, after those of --settings; may repeat
+                     (e.g. --set delayMs=48 --set alphaFunction=0,0,0.5,1,1,1)
+Run and output:
+  --duration S       seconds to run (default 10, at most 3600)
+  --out DIR          output folder (default sim-out)
+  --width W          width of the space-time picture in pixels, 16 to 4096 (default 320)
+  --no-reference     skip the mode-2 run on the same game
+  --quiet            print nothing but errors
+  --help             print this and exit
+)";
+}
+
+Result<std::vector<host::SettingValue>> gatherSettings(const Options& options) {
+    Result<std::vector<host::SettingValue>> result;
+    if (!options.settingsPath.empty()) {
+        result = readSettingsFile(options.settingsPath);
+        if (!result.ok()) return result;
+    }
+    result.value.insert(result.value.end(), options.overrides.begin(), options.overrides.end());
+    return result;
+}
+
+}  // namespace verolux::sim

@@ -1,0 +1,43 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "host/SettingsMessage.h"
+#include "sim/Result.h"
+
+namespace verolux::sim {
+
+// What verolux-sim was asked to do. Without a capture the game is generated: frames at fps with
+// a normally distributed queue-time jitter and render time, from the seed.
+struct Options {
+    double fps = 30;
+    double jitterMs = 1;
+    double renderMs = 8;  // mean GPU time of a frame
+    double hz = 60;
+    uint32_t mode = 0;
+    uint32_t slots = 3;  // buffer-queue slots
+    double durationSec = 10;
+    std::string outDir = "sim-out";
+    std::string capturePath;                    // empty: the generator above plays the game
+    std::string settingsPath;                   // empty: no settings file
+    std::vector<host::SettingValue> overrides;  // --set values, in the order given
+    uint64_t seed = 1;
+    uint32_t width = 320;   // picture width in pixels
+    bool reference = true;  // also run mode 2 on the same game
+    bool quiet = false;
+    bool help = false;
+};
+
+// argv[0] is the program and is skipped. Options take their value as the next argument or after
+// '=' (--fps=60); --set may repeat. --help stops parsing and wins over anything after it.
+Result<Options> parseOptions(int argc, const char* const* argv);
+
+std::string usage();
+
+// The settings message of a run: the settings file's values, then the --set overrides, so that
+// an override wins when the library applies the entries in order.
+Result<std::vector<host::SettingValue>> gatherSettings(const Options& options);
+
+}  // namespace verolux::sim

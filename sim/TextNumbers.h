@@ -1,0 +1,17 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string_view>
+
+namespace verolux::sim {
+
+// Numbers typed by users or read from files. The whole text must be the number: no sign other
+// than a leading '-', no spaces, no trailing characters; doubles must be finite.
+std::optional<int64_t> parseInteger(std::string_view text);
+std::optional<double> parseNumber(std::string_view text);
+
+// The text without leading and trailing spaces, tabs and carriage returns.
+std::string_view trim(std::string_view text);
+
+}  // namespace verolux::sim
