@@ -1,50 +1,13 @@
 #include <benchmark/benchmark.h>
 
-#include <atomic>
-#include <cstdlib>
-#include <new>
 #include <vector>
 
+#include "AllocationCounter.h"
 #include "FrameTimings.h"
 #include "RollingStatistics.h"
 
-// The binary's one replacement of the global allocator: it counts every allocation, so that each
-// benchmark can report how many its measured loop made (the timing paths promise none).
-namespace {
-std::atomic<uint64_t> sAllocations{0};
-}  // namespace
-
-// Not inlined: GCC would otherwise see free() meet a pointer from operator new, or a malloc()
-// pointer meet operator delete, and warn.
-[[gnu::noinline]] void* operator new(size_t size) {
-    sAllocations.fetch_add(1, std::memory_order_relaxed);
-    if (void* p = std::malloc(size == 0 ? 1 : size)) return p;
-    throw std::bad_alloc();
-}
-[[gnu::noinline]] void operator delete(void* p) noexcept {
-    std::free(p);
-}
-[[gnu::noinline]] void operator delete(void* p, size_t) noexcept {
-    std::free(p);
-}
-
 namespace android::Interpolation {
 namespace {
-
-class AllocationCounter {
-public:
-    explicit AllocationCounter(benchmark::State& state)
-        : mState(state), mStart(sAllocations.load()) {}
-    ~AllocationCounter() {
-        mState.counters["allocs/iter"] =
-                benchmark::Counter(static_cast<double>(sAllocations.load() - mStart),
-                                   benchmark::Counter::kAvgIterations);
-    }
-
-private:
-    benchmark::State& mState;
-    const uint64_t mStart;
-};
 
 // Render times around 8 ms with up to 2 ms of jitter, so that the variance never collapses and
 // the updates stay on the O(1) path.
