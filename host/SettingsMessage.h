@@ -1,7 +1,7 @@
 #pragma once
 
-#include <memory>
 #include <limits>
+#include <memory>
 
 #include <binder/Parcel.h>
 

@@ -14,14 +14,14 @@ namespace verolux::sim {
 
 // One game frame, from the producer's dequeue to the release of its buffer.
 struct FrameRecord {
-    uint64_t number = 0;          // the producer's frame number, from 1
-    int slot = -1;                // buffer-queue slot
-    nsecs_t contentTime = -1;     // the game time the frame's picture shows
+    uint64_t number = 0;       // the producer's frame number, from 1
+    int slot = -1;             // buffer-queue slot
+    nsecs_t contentTime = -1;  // the game time the frame's picture shows
     nsecs_t dequeueTime = -1;
     nsecs_t queueTime = -1;       // also the frame's timestamp
     nsecs_t renderDoneTime = -1;  // when its acquire fence signalled
     nsecs_t acquireTime = -1;
-    nsecs_t releaseTime = -1;     // when its buffer went back to the producer
+    nsecs_t releaseTime = -1;       // when its buffer went back to the producer
     nsecs_t firstDisplayTime = -1;  // vsync of the first refresh that showed any of it
 };
 

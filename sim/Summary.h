@@ -17,7 +17,7 @@ struct Summary {
     size_t queuedFrames = 0;       // frames with a queue time
     size_t refreshes = 0;
     std::optional<double> gameFps;       // queued frames per second of run
-    std::optional<double> displayedFps;  // refreshes of kind 8 or 64 per second of run
+    std::optional<double> displayedFps;  // refreshes showing a picture unlike the last, per second
     // Shares of all refreshes, 0 to 1, by composition kind; "no state" is any other kind (0: the
     // library announced none), so the four add up to 1.
     double blendShare = 0;

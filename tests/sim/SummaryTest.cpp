@@ -43,7 +43,7 @@ TEST(SummaryTest, countsRatesSharesLatencyJudderAndCpuOfAHandMadeRun) {
     const Summary s = summarize(oneSecond());
     EXPECT_EQ(1.0, s.runSec);
     EXPECT_EQ(4.0, s.gameFps);
-    EXPECT_EQ(3.0, s.displayedFps);  // two new pictures and one blend
+    EXPECT_EQ(3.0, s.displayedFps);  // content 100, 120 and 180; 120 again is no new picture
     EXPECT_DOUBLE_EQ(0.2, s.blendShare);
     EXPECT_DOUBLE_EQ(0.2, s.repeatShare);
     EXPECT_DOUBLE_EQ(0.4, s.newShare);
@@ -73,7 +73,7 @@ TEST(SummaryTest, printsTheRunAndTheReferenceSideBySide) {
             "                                  run (mode 0)               reference (mode 2)\n"
             "run length                        1.000 s                    n/a\n"
             "game fps (frames queued)          4.00                       n/a\n"
-            "displayed fps (kinds 8 and 64)    3.00                       n/a\n"
+            "displayed fps (new pictures)      3.00                       n/a\n"
             "refreshes                         5                          1\n"
             "blended (kind 8)                  20.0 %                     0.0 %\n"
             "repeated (kind 16)                20.0 %                     100.0 %\n"

@@ -1,0 +1,76 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <mutex>
+#include <set>
+
+#include "host/LayerHost.h"
+#include "support/Frames.h"
+
+namespace verolux::host {
+namespace {
+
+using namespace android;
+using namespace android::Interpolation;
+using namespace std::chrono_literals;
+using std::chrono::steady_clock;
+
+class LayerHostTest : public testing::TestWithParam<uint32_t> {
+protected:
+    std::unique_ptr<LayerHost> makeHost() {
+        LayerHost::Config config;
+        config.name = String8("game#5");
+        config.uid = mUid;
+        config.mode = static_cast<InterpolationMode>(GetParam());
+        return std::make_unique<LayerHost>(config, [this](const FrameItem& frame) {
+            std::lock_guard lock(mMutex);
+            mReturned.push_back(frame.mIndex);
+        });
+    }
+
+    // Queues and acquires frames 1..count, 10 ms apart from now on.
+    void queueFrames(LayerHost& host, int count) {
+        const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
+        for (int i = 1; i <= count; i++) {
+            const sp<GraphicBuffer> buffer = new GraphicBuffer(1, 1, PIXEL_FORMAT_RGBA_8888);
+            const sp<Fence> fence = Fence::createSignalled(now);
+            host.onBufferDequeued(i, now, now);
+            host.onBufferQueued(i, i, buffer, now + i * 10'000'000, fence);
+            host.onBufferAcquired(i, i, buffer, now + i * 10'000'000, fence);
+        }
+    }
+
+    std::vector<uint64_t> returned() {
+        std::lock_guard lock(mMutex);
+        return mReturned;
+    }
+
+    const uint32_t mUid = test::nextTestUid();
+    std::mutex mMutex;
+    std::vector<uint64_t> mReturned;  // guarded by mMutex
+};
+
+TEST_P(LayerHostTest, tearDownWithAStateStillLockedReturnsEveryFrameOnce) {
+    std::unique_ptr<LayerHost> host = makeHost();
+    host->start();
+    queueFrames(*host, 3);
+    // A composition whose frames were never given back, as when the display dies mid-frame.
+    const RenderState held = host->compose(systemTime(SYSTEM_TIME_MONOTONIC) + 15'000'000);
+
+    const auto start = steady_clock::now();
+    host->stop();
+    EXPECT_LT(steady_clock::now() - start, 200ms);
+    const std::vector<uint64_t> frames = returned();
+    EXPECT_EQ(3u, frames.size());
+    EXPECT_EQ(3u, std::set<uint64_t>(frames.begin(), frames.end()).size());
+    EXPECT_EQ(0u, host->frameList()->size());
+}
+
+INSTANTIATE_TEST_SUITE_P(AllModes, LayerHostTest, testing::Range(0u, 6u),
+                         [](const testing::TestParamInfo<uint32_t>& info) {
+                             return "mode" + std::to_string(info.param);
+                         });
+
+}  // namespace
+}  // namespace verolux::host
