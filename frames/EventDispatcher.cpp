@@ -2,6 +2,7 @@
 
 #include <algorithm>
 
+#include "DeferredRelease.h"
 #include "Log.h"
 
 namespace android::Interpolation {
@@ -22,18 +23,6 @@ void* promotedPointer(const wp<EventDispatcher::EventReceiver>& receiver) {
     return receiver.promote().get();
 }
 
-// The receivers called by this thread's broadcast. Their strong references are dropped only after
-// the bus's mutex is released: a receiver whose last reference goes here unsubscribes from its
-// onLastStrongRef, which would otherwise deadlock on that mutex.
-thread_local std::vector<sp<EventDispatcher::EventReceiver>> tCalledReceivers;
-
-void releaseCalledReceivers() {
-    std::vector<sp<EventDispatcher::EventReceiver>> called;
-    called.swap(tCalledReceivers);
-    called.clear();  // may run destructors, which may broadcast again on this thread
-    if (tCalledReceivers.capacity() < called.capacity()) tCalledReceivers.swap(called);
-}
-
 }  // namespace
 
 EventDispatcher& EventDispatcher::getInstanceLocked() {
@@ -47,7 +36,9 @@ void EventDispatcher::broadcastEvent(const uint32_t& uid, const EventType& type,
         std::lock_guard lock(mMutex);
         getInstanceLocked().broadcastEventLocked(uid, type, time, data);
     }
-    if (!tCalledReceivers.empty()) releaseCalledReceivers();
+    // The receivers called keep their references until here, so that one whose last reference
+    // goes can unsubscribe.
+    DeferredRelease<EventReceiver>::releaseAll();
 }
 
 void EventDispatcher::subscribe(const uint32_t& uid, const uint32_t& flags,
@@ -90,7 +81,7 @@ void EventDispatcher::broadcastEventLocked(const uint32_t& uid, const EventType&
             continue;
         }
         strong->onEvent(type, time, data);
-        tCalledReceivers.push_back(std::move(strong));
+        DeferredRelease<EventReceiver>::hold(std::move(strong));
     }
 }
 

@@ -13,6 +13,7 @@
 #include <variant>
 #include <vector>
 
+#include "DeferredRelease.h"
 #include "Log.h"
 #include "Tunables.h"
 
@@ -24,19 +25,6 @@ std::mutex SettingsController::mInstanceMutex;
 namespace {
 
 constexpr size_t WORD = sizeof(int32_t);
-
-// The observers promoted by this thread's notifyChanges. Their strong references are dropped only
-// after the controller's mutex is released: an observer whose last reference goes here unsubscribes
-// from its onLastStrongRef, which would otherwise deadlock on that mutex. Kept per thread so that
-// its capacity is reused by the next call.
-thread_local std::vector<sp<SettingsController::Observer>> tPromotedObservers;
-
-void releasePromotedObservers() {
-    std::vector<sp<SettingsController::Observer>> promoted;
-    promoted.swap(tPromotedObservers);
-    promoted.clear();  // may run onLastStrongRef, which may call back into the controller
-    if (tPromotedObservers.capacity() < promoted.capacity()) tPromotedObservers.swap(promoted);
-}
 
 // Parameter 21: int32 n, then n pairs of float x, float y.
 Function readAlphaFunction(const Parcel& parcel) {
@@ -297,7 +285,7 @@ void SettingsController::notifyChanges() {
         if (mChangedUids.empty()) return;
 
         // One promotion per observer for all uids; dead observers leave the set here.
-        std::vector<sp<Observer>>& promoted = tPromotedObservers;
+        std::vector<sp<Observer>>& promoted = DeferredRelease<Observer>::held();
         for (auto it = mObservers.begin(); it != mObservers.end();) {
             sp<Observer> observer = it->promote();
             if (observer == nullptr) {
@@ -321,7 +309,7 @@ void SettingsController::notifyChanges() {
             uid = notified ? mChangedUids.erase(uid) : std::next(uid);
         }
     }
-    releasePromotedObservers();
+    DeferredRelease<Observer>::releaseAll();
 }
 
 void SettingsController::subscribe(wp<Observer> o) {

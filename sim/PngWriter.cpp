@@ -8,7 +8,11 @@
 #include <cstring>
 #include <vector>
 
+#include "EventDispatcher.h"
+
 namespace verolux::sim {
+
+using namespace android::Interpolation;
 
 namespace {
 
@@ -39,11 +43,11 @@ uint8_t* fill(uint8_t* out, Rgb colour, size_t pixels) {
 
 Rgb kindColour(uint32_t kind) {
     switch (kind) {
-        case 64:
+        case eNewFrameCompositionEvent:
             return NEW_COLOUR;
-        case 8:
+        case eBlendedCompositionEvent:
             return BLEND_COLOUR;
-        case 16:
+        case eRepeatedCompositionEvent:
             return REPEAT_COLOUR;
         default:
             return NO_STATE_COLOUR;

@@ -7,13 +7,14 @@
 #include <numeric>
 #include <vector>
 
+#include "EventDispatcher.h"
+
 namespace verolux::sim {
+
+using namespace android::Interpolation;
 
 namespace {
 
-constexpr uint32_t KIND_BLEND = 8;
-constexpr uint32_t KIND_REPEAT = 16;
-constexpr uint32_t KIND_NEW = 64;
 constexpr double NS_PER_MS = 1e6;
 constexpr double NS_PER_US = 1e3;
 
@@ -89,9 +90,9 @@ Summary summarize(const Recording& recording) {
             pictures++;
             lastPicture = refresh.contentTime;
         }
-        blends += refresh.kind == KIND_BLEND;
-        repeats += refresh.kind == KIND_REPEAT;
-        news += refresh.kind == KIND_NEW;
+        blends += refresh.kind == eBlendedCompositionEvent;
+        repeats += refresh.kind == eRepeatedCompositionEvent;
+        news += refresh.kind == eNewFrameCompositionEvent;
         cpu.push_back(refresh.cpuTime / NS_PER_US);
         if (previous != nullptr && previous->contentTime >= 0 && refresh.contentTime >= 0) {
             steps.push_back((refresh.contentTime - previous->contentTime) / NS_PER_MS);

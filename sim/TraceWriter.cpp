@@ -8,7 +8,11 @@
 #include <fstream>
 #include <memory>
 
+#include "EventDispatcher.h"
+
 namespace verolux::sim {
+
+using namespace android::Interpolation;
 
 namespace {
 
@@ -91,11 +95,11 @@ std::string stateName(const RefreshRecord& refresh) {
         frames += std::to_string(item.frameNumber);
     }
     switch (refresh.kind) {
-        case 8:
+        case eBlendedCompositionEvent:
             return "blend " + frames;
-        case 16:
+        case eRepeatedCompositionEvent:
             return "repeat " + frames;
-        case 64:
+        case eNewFrameCompositionEvent:
             return "new " + frames;
         default:
             return frames.empty() ? "no state" : "state " + frames;
