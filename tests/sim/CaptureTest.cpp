@@ -13,59 +13,45 @@ Result<Capture> parse(const std::string& text, size_t maxFrames = MAX_CAPTURE_FR
     return parseCapture(in, "capture.csv", maxFrames);
 }
 
-std::vector<std::pair<nsecs_t, nsecs_t>> times(const Capture& capture) {
+std::vector<std::pair<nsecs_t, nsecs_t>> times(const Result<Capture>& capture) {
+    EXPECT_TRUE(capture.ok()) << capture.error;
     std::vector<std::pair<nsecs_t, nsecs_t>> out;
-    for (const CaptureFrame& f : capture.frames)
+    for (const CaptureFrame& f : capture.value.frames)
         out.emplace_back(f.queueTime, f.renderDoneTime);
     return out;
 }
 
 TEST(CaptureTest, readsQueueAndRenderDoneTimesFromWhereverTheirColumnsAre) {
-    auto capture =
-            parse("\xEF\xBB\xBF"
-                  "frame, render_done_ns ,display_ns,queue_ns\r\n"
-                  "0,1008,,1000\r\n"
-                  "1,,2100,1033\r\n"
-                  "\r\n"
-                  "2, 1080 ,2200,1066\r\n");
-    ASSERT_TRUE(capture.ok()) << capture.error;
     // Relative to the first frame's queue time; an empty render-done cell is unknown.
-    EXPECT_THAT(times(capture.value),
+    EXPECT_THAT(times(parse("\xEF\xBB\xBF"
+                            "frame, render_done_ns ,display_ns,queue_ns\r\n"
+                            "0,1008,,1000\r\n1,,2100,1033\r\n\r\n2, 1080 ,2200,1066\r\n")),
                 testing::ElementsAre(std::pair(0, 8), std::pair(33, -1), std::pair(66, 80)));
-
-    auto queueOnly = parse("queue_ns\n0\n5\n5");
-    ASSERT_TRUE(queueOnly.ok()) << queueOnly.error;
-    EXPECT_THAT(times(queueOnly.value),
+    EXPECT_THAT(times(parse("queue_ns\n0\n5\n5")),
                 testing::ElementsAre(std::pair(0, -1), std::pair(5, -1), std::pair(5, -1)));
 }
 
 TEST(CaptureTest, badInputNamesTheFileAndTheLine) {
     const std::string header = "frame,queue_ns,render_done_ns\n0,0,10\n";
     const std::vector<std::pair<std::string, std::string>> cases = {
-            {header + "1,abc,20\n", "capture.csv:3: queue_ns is not a number"},
-            {header + "1,2.5,20\n", "capture.csv:3: queue_ns is not a number"},
-            {header + "1,,20\n", "capture.csv:3: queue_ns is empty"},
-            {header + "1,-5,20\n",
-             "capture.csv:3: queue_ns is out of range (0 to 24 hours in "
-             "nanoseconds)"},
-            {header + "1,99999999999999999999,\n", "capture.csv:3: queue_ns is not a number"},
-            {header + "\n1,40,x\n", "capture.csv:4: render_done_ns is not a number"},
-            {header + "1,40,39\n", "capture.csv:3: render_done_ns is earlier than queue_ns"},
-            {header + "1,40,50\n2,39,50\n",
-             "capture.csv:4: queue_ns is earlier than the "
-             "previous frame's"},
-            {header + "1,40\n", "capture.csv:3: expected 3 cells, found 2"},
-            {"frame,display_ns\n0,0\n", "capture.csv:1: the header names no queue_ns column"},
-            {"queue_ns,queue_ns\n0,0\n", "capture.csv:1: column \"queue_ns\" appears twice"},
-            {"queue_ns\n0\n" + std::string(5000, '1') + "\n",
-             "capture.csv:3: line is longer than 4096 characters"},
-            {"queue_ns\n\n", "capture.csv: no frames after the header"},
-            {"", "capture.csv: empty, expected a header line naming queue_ns"},
+            {header + "1,abc,20\n", ":3: queue_ns is not a number"},
+            {header + "1,2.5,20\n", ":3: queue_ns is not a number"},
+            {header + "1,,20\n", ":3: queue_ns is empty"},
+            {header + "1,-5,20\n", ":3: queue_ns is out of range (0 to 24 hours in nanoseconds)"},
+            {header + "1,99999999999999999999,\n", ":3: queue_ns is not a number"},
+            {header + "\n1,40,x\n", ":4: render_done_ns is not a number"},
+            {header + "1,40,39\n", ":3: render_done_ns is earlier than queue_ns"},
+            {header + "1,40,50\n2,39,50\n", ":4: queue_ns is earlier than the previous frame's"},
+            {header + "1,40\n", ":3: expected 3 cells, found 2"},
+            {"frame,display_ns\n0,0\n", ":1: the header names no queue_ns column"},
+            {"queue_ns,queue_ns\n0,0\n", ":1: column \"queue_ns\" appears twice"},
+            {"queue_ns\n0\n" + std::string(5000, '1'), ":3: line is longer than 4096 characters"},
+            {"queue_ns\n\n", ": no frames after the header"},
+            {"", ": empty, expected a header line naming queue_ns"},
     };
     for (const auto& [text, message] : cases) {
-        EXPECT_EQ("verolux-sim: " + message, parse(text).error) << text;
+        EXPECT_EQ("verolux-sim: capture.csv" + message, parse(text).error) << text;
     }
-    EXPECT_TRUE(parse("queue_ns\n0\n1\n2\n", 3).ok());
     EXPECT_EQ("verolux-sim: capture.csv:5: more than 3 frames",
               parse("queue_ns\n0\n1\n2\n3\n", 3).error);
     EXPECT_EQ("verolux-sim: cannot read capture /nonexistent/c.csv: No such file or directory",
@@ -75,10 +61,9 @@ TEST(CaptureTest, badInputNamesTheFileAndTheLine) {
 TEST(CaptureTest, theShippedCaptureIsValid) {
     auto capture = readCapture(VEROLUX_SOURCE_DIR "/sim/captures/stutter30.frames.csv");
     ASSERT_TRUE(capture.ok()) << capture.error;
-    ASSERT_EQ(300u, capture.value.frames.size());
-    // Frame 60 is one of the long ones: the next frame comes about 83 ms later.
     const auto& frames = capture.value.frames;
-    EXPECT_GT(frames[61].queueTime - frames[60].queueTime, 80'000'000);
+    ASSERT_EQ(300u, frames.size());
+    EXPECT_GT(frames[61].queueTime - frames[60].queueTime, 80'000'000);  // a long frame: 83 ms
     EXPECT_EQ(-1, frames[100].renderDoneTime);
 }
 

@@ -1,10 +1,13 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
 
-#include <filesystem>
+#include <cstdio>
+#include <cstring>
 #include <fstream>
 
 #include "sim/Options.h"
+#include "sim/SettingsKeys.h"
 
 namespace verolux::sim {
 namespace {
@@ -14,32 +17,49 @@ Result<Options> parse(std::vector<const char*> args) {
     return parseOptions(static_cast<int>(args.size()), args.data());
 }
 
-TEST(OptionsTest, takesValuesAsTheNextArgumentOrAfterAnEqualsSign) {
-    auto none = parse({});
-    ASSERT_TRUE(none.ok());
-    EXPECT_EQ(30, none.value.fps);
-    EXPECT_EQ("sim-out", none.value.outDir);
-    EXPECT_TRUE(none.value.reference);
+using Points = std::vector<host::SettingValue::Point>;
 
-    auto some = parse({"--fps", "59.94", "--hz=120", "--slots", "64", "--capture=c.csv", "--set",
-                       "delayMs=40", "--set=mode=2", "--seed", "18446744073709551615",
-                       "--no-reference"});
-    ASSERT_TRUE(some.ok()) << some.error;
-    const Options& o = some.value;
-    EXPECT_EQ(59.94, o.fps);
-    EXPECT_EQ(120, o.hz);
-    EXPECT_EQ(64u, o.slots);
-    EXPECT_EQ("c.csv", o.capturePath);
-    ASSERT_EQ(2u, o.overrides.size());
-    EXPECT_EQ(7, o.overrides[1].id);
-    EXPECT_EQ(UINT64_MAX, o.seed);
-    EXPECT_FALSE(o.reference);
-
-    auto help = parse({"--fps", "5", "--help", "--hz", "0"});
-    EXPECT_TRUE(help.ok() && help.value.help);
+// The settings message that carries `settings`, word by word.
+std::vector<uint32_t> message(const std::vector<host::SettingValue>& settings) {
+    android::Parcel parcel;
+    host::writeSettingsMessage(settings, parcel);
+    std::vector<uint32_t> words(parcel.dataSize() / 4);
+    memcpy(words.data(), parcel.data(), words.size() * 4);
+    return words;
 }
 
-TEST(OptionsTest, refusesImpossibleValuesWithOneLineEach) {
+TEST(OptionsTest, takesValuesNextOrAfterAnEqualsSignAndPutsTheSettingsFileBeforeTheOverrides) {
+    const std::string path = testing::TempDir() + "verolux-" + std::to_string(getpid()) + ".json";
+    std::ofstream(path) << R"({  // comments are allowed
+        "smartDelay": 0, "delayMs": 40, "rfps": 90, "hitThreshold": 1,
+        "alphaFunction": [0, 0, [0.25, 0.5]]})";
+    auto parsed =
+            parse({"--fps", "59.94", "--hz=120", "--slots=64", "--capture=c.csv", "--seed",
+                   "18446744073709551615", "--no-reference", "--set", "delayMs=20", "--settings",
+                   path.c_str(), "--set=hitTarget = 0.95", "--set=keepTwoHwcLayers=1",
+                   "--set=smartDelay=false", "--set=alphaFunction=0,0, 0.5,1,1,1",
+                   "--set=gameFpsLimit=30", "--set=mode=2"});
+    ASSERT_TRUE(parsed.ok()) << parsed.error;
+    EXPECT_EQ(59.94, parsed.value.fps);
+    EXPECT_EQ(120, parsed.value.hz);
+    EXPECT_EQ(64u, parsed.value.slots);
+    EXPECT_EQ("c.csv", parsed.value.capturePath);
+    EXPECT_EQ(UINT64_MAX, parsed.value.seed);
+    EXPECT_FALSE(parsed.value.reference);
+    auto settings = gatherSettings(parsed.value);
+    std::remove(path.c_str());
+    ASSERT_TRUE(settings.ok()) << settings.error;
+    const Points fileCurve = {{0, 0}, {0.25f, 0.5f}};
+    const Points setCurve = {{0, 0}, {0.5f, 1}, {1, 1}};
+    const std::vector<host::SettingValue> expected = {
+            {21, fileCurve}, {1, 40},     {6, 1.0f},  {18, 90},       {2, false}, {1, 20},
+            {4, 0.95f},      {115, true}, {2, false}, {21, setCurve}, {0, 30},    {7, 2}};
+    EXPECT_EQ(message(expected), message(settings.value));
+
+    EXPECT_TRUE(parse({"--fps", "5", "--help", "--hz", "0"}).value.help);
+}
+
+TEST(OptionsTest, refusesImpossibleOptionsAndSettingsWithOneLineEach) {
     const std::vector<std::pair<std::vector<const char*>, std::string>> cases = {
             {{"--hz", "0"}, "--hz must be between 1 and 1000 (got 0)"},
             {{"--fps", "-5"}, "--fps must be greater than 0 and at most 1000 (got -5)"},
@@ -59,31 +79,45 @@ TEST(OptionsTest, refusesImpossibleValuesWithOneLineEach) {
             {{"--quiet=1"}, "--quiet takes no value"},
             {{"--fsp", "30"}, "unknown option \"--fsp\" (try --help)"},
             {{"30"}, "unexpected argument \"30\" (try --help)"},
-            {{"--set", "hz=60"}, "--set: unknown settings key \"hz\""},
+            {{"--set=gameFpsLimt=30"}, "--set: unknown settings key \"gameFpsLimt\""},
+            {{"--set=delayMs"}, "--set expects key=value (got \"delayMs\")"},
+            {{"--set=delayMs=1.5"}, "--set: delayMs expects a whole number (got \"1.5\")"},
+            {{"--set=delayMs=4294967296"}, "--set: delayMs is out of range (got \"4294967296\")"},
+            {{"--set=hitTarget=nan"}, "--set: hitTarget expects a number (got \"nan\")"},
+            {{"--set=smartDelay=yes"},
+             "--set: smartDelay expects true, false, 1 or 0 (got \"yes\")"},
+            {{"--set=mode=6"}, "--set: mode must be between 0 and 5 (got 6)"},
+            {{"--set=alphaFunction=0,0,1"},
+             "--set: alphaFunction needs an even number of values, x,y per point (got 3)"},
+            {{"--set=alphaFunction=0,0,"},
+             "--set: alphaFunction expects a list of x,y numbers (got \"0,0,\")"},
+            {{"--set=alphaFunction="}, "--set: alphaFunction needs at least one x,y point"},
+            // Control characters stay off the line.
+            {{"--set=a\nb=1"}, "--set: unknown settings key \"a?b\""},
     };
     for (const auto& [args, message] : cases) {
-        auto result = parse(args);
-        EXPECT_EQ("verolux-sim: " + message, result.error) << args[0];
+        EXPECT_EQ("verolux-sim: " + message, parse(args).error) << args[0];
     }
 }
 
-TEST(OptionsTest, settingsFromTheFileComeBeforeTheOverrides) {
-    const auto dir = std::filesystem::temp_directory_path() / "verolux-options-test";
-    std::filesystem::create_directories(dir);
-    const std::string path = (dir / "s.json").string();
-    std::ofstream(path) << R"({"delayMs": 40, "rfps": 90})";
-
-    auto options = parse({"--set", "delayMs=20", "--settings", path.c_str()});
-    ASSERT_TRUE(options.ok()) << options.error;
-    auto settings = gatherSettings(options.value);
-    std::filesystem::remove_all(dir);
-    ASSERT_TRUE(settings.ok()) << settings.error;
-
-    std::vector<std::pair<int32_t, int32_t>> entries;
-    for (const host::SettingValue& v : settings.value)
-        entries.emplace_back(v.id, std::get<int32_t>(v.value));
-    EXPECT_THAT(entries,
-                testing::ElementsAre(std::pair(1, 40), std::pair(18, 90), std::pair(1, 20)));
+TEST(OptionsTest, badSettingsJsonNamesTheFileAndTheProblem) {
+    const std::vector<std::pair<std::string, std::string>> cases = {
+            {R"({"fps": 30})", "unknown settings key \"fps\""},
+            {R"({"delayMs": "40"})", "delayMs expects a whole number (got \"40\")"},
+            {R"({"smartDelay": 2})", "smartDelay expects true, false, 1 or 0 (got \"2\")"},
+            {R"({"alphaFunction": [[0, 0, 1]]})",
+             "alphaFunction expects numbers or [x, y] pairs (got \"[0,0,1]\")"},
+            {"[1, 2]", "expected an object of settings keys"},
+            {R"({"delayMs": 40 "mode": 1})",
+             "invalid JSON: Line 1, Column 16: Missing ',' or '}' in object declaration"},
+            {R"({"mode": 1, "mode": 2})", "invalid JSON: Line 1, Column 13: Duplicate key: 'mode'"},
+    };
+    for (const auto& [text, message] : cases) {
+        EXPECT_EQ("verolux-sim: s.json: " + message, parseSettingsJson(text, "s.json").error);
+    }
+    EXPECT_EQ(
+            "verolux-sim: cannot read settings file /nonexistent/s.json: No such file or directory",
+            readSettingsFile("/nonexistent/s.json").error);
 }
 
 }  // namespace

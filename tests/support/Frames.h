@@ -6,8 +6,7 @@
 
 namespace android::test {
 
-// Each test takes uids of its own, so that subscriptions left in the process-wide singletons by
-// one test never reach another.
+// A uid no other test uses: what one test leaves in the process-wide singletons never reaches another.
 inline uint32_t nextTestUid() {
     static std::atomic<uint32_t> next{100000};
     return next++;

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <algorithm>
 #include <string>
 #include <vector>
 
@@ -11,8 +12,7 @@ struct LogLine {
     std::string text;
 };
 
-// Records every platform log line printed while it lives, and sets the library's logLevel for that
-// time.
+// Records the platform log lines printed while it lives, with the library's logLevel set to `level`.
 class LogCapture {
 public:
     explicit LogCapture(int level = 2);
@@ -21,9 +21,17 @@ public:
     LogCapture& operator=(const LogCapture&) = delete;
 
     std::vector<LogLine> lines() const;
-    std::vector<std::string> texts() const;
+    std::vector<std::string> texts() const {
+        std::vector<std::string> texts;
+        for (const LogLine& line : lines())
+            texts.push_back(line.text);
+        return texts;
+    }
     // Number of lines whose text is exactly `text`.
-    int count(const std::string& text) const;
+    int count(const std::string& text) const {
+        const std::vector<std::string> all = texts();
+        return static_cast<int>(std::count(all.begin(), all.end(), text));
+    }
     bool contains(const std::string& text) const { return count(text) > 0; }
     void clear();
 

@@ -7,7 +7,6 @@
 
 namespace android::test {
 
-// Records every event it receives, in order.
 class RecordingReceiver : public Interpolation::EventDispatcher::EventReceiver {
 public:
     struct Event {
@@ -28,9 +27,8 @@ public:
     }
 
     std::vector<uint32_t> types() const {
-        std::lock_guard lock(mMutex);
         std::vector<uint32_t> types;
-        for (const Event& event : mEvents)
+        for (const Event& event : events())
             types.push_back(event.type);
         return types;
     }

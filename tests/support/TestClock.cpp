@@ -4,15 +4,10 @@
 
 #include <atomic>
 
-namespace {
-
-std::atomic<bool> sFake{false};
-std::atomic<nsecs_t> sNow{0};
-
-}  // namespace
+static std::atomic<nsecs_t> sNow{-1};  // the time of the living TestClock; -1: none lives
 
 extern "C" nsecs_t systemTime(int clock) {
-    if (sFake.load()) return sNow.load();
+    if (const nsecs_t now = sNow.load(); now >= 0) return now;
     static constexpr clockid_t clocks[] = {CLOCK_REALTIME, CLOCK_MONOTONIC, CLOCK_PROCESS_CPUTIME_ID,
                                            CLOCK_THREAD_CPUTIME_ID, CLOCK_BOOTTIME};
     timespec ts{};
@@ -20,27 +15,6 @@ extern "C" nsecs_t systemTime(int clock) {
     return nsecs_t{ts.tv_sec} * 1'000'000'000 + ts.tv_nsec;
 }
 
-namespace android::test {
-
-TestClock::TestClock(nsecs_t now) {
-    sNow.store(now);
-    sFake.store(true);
-}
-
-TestClock::~TestClock() {
-    sFake.store(false);
-}
-
-nsecs_t TestClock::now() const {
-    return sNow.load();
-}
-
-void TestClock::set(nsecs_t now) {
+void android::test::TestClock::set(nsecs_t now) {
     sNow.store(now);
 }
-
-void TestClock::advance(nsecs_t duration) {
-    sNow.fetch_add(duration);
-}
-
-}  // namespace android::test

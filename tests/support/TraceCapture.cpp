@@ -5,18 +5,14 @@
 #include <atomic>
 #include <mutex>
 
-namespace {
+static std::atomic<uint64_t> sEnabledTags{0};
+static std::mutex sMutex;
+static std::vector<std::string> sEvents;  // guarded by sMutex
 
-std::atomic<uint64_t> sEnabledTags{0};
-std::mutex sMutex;
-std::vector<std::string> sEvents;  // guarded by sMutex
-
-void record(std::string event) {
+static void record(std::string event) {
     std::lock_guard lock(sMutex);
     sEvents.push_back(std::move(event));
 }
-
-}  // namespace
 
 extern "C" uint64_t atrace_get_enabled_tags() {
     return sEnabledTags.load();
@@ -44,8 +40,6 @@ TraceCapture::TraceCapture() {
 
 TraceCapture::~TraceCapture() {
     sEnabledTags.store(0);
-    std::lock_guard lock(sMutex);
-    sEvents.clear();
 }
 
 std::vector<std::string> TraceCapture::events() const {
