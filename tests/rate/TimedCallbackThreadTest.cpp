@@ -3,6 +3,7 @@
 #include <atomic>
 #include <chrono>
 #include <future>
+#include <thread>
 #include <tuple>
 
 #include "TimedCallbackThread.h"
@@ -19,7 +20,7 @@ class TimedCallbackThreadTest : public testing::Test {
 protected:
     void arm(nsecs_t period, nsecs_t now) {
         mThread.timer.arm(
-                period, now, [this] { mFires++; }, /*once=*/false);
+                period, now, [this] { mFires++; }, false);
     }
 
     TimedCallbackThread mThread;
@@ -59,12 +60,13 @@ TEST_F(TimedCallbackThreadTest, stalledScheduleCatchesUpAtMostOneSecondAcrossCyc
 TEST_F(TimedCallbackThreadTest, sleepsUntilEachDueTimeAndUntilNotifiedWhenNoneIsReachable) {
     arm(5 * MS, systemTime(SYSTEM_TIME_MONOTONIC));
     mThread.cycleCallback = [&] {
-        if (++mCycles != 3) return;
         std::lock_guard lock(mThread.mutex);
-        mThread.timer.nextTime = INT64_MAX;  // its deadline would overflow
+        if (++mCycles == 3) mThread.timer.nextTime = INT64_MAX;  // its deadline would overflow
     };
     auto done = std::async(std::launch::async, [&] { mThread.threadLoop(); });
-    EXPECT_EQ(std::future_status::timeout, done.wait_for(50ms));
+    while (mCycles < 3)
+        std::this_thread::sleep_for(1ms);
+    EXPECT_EQ(std::future_status::timeout, done.wait_for(30ms));
     {
         // A negative due time, which the slack keeps from being due.
         std::lock_guard lock(mThread.mutex);

@@ -7,6 +7,7 @@
 #include <gui/InterpolationGui.h>
 #include <json/json.h>
 
+#include <cmath>
 #include <cstring>
 #include <functional>
 
@@ -20,9 +21,49 @@ namespace {
 
 using test::LogCapture;
 using testing::ElementsAre;
-using testing::IsEmpty;
 
-// One 4-byte parcel word, written from an int32 or a float.
+TEST(FunctionTest, dropsPointsOutOfOrderRaisesFallingOnesAndIgnoresAnOddValueButNotNaNs) {
+    LogCapture log(1);
+    EXPECT_THAT(Function({0.5f, 0.5f, 0.4f, 0.9f}, true).getPoints(),
+                ElementsAre(Point{0, 0}, Point{0.5f, 0.5f}, Point{1, 1}));
+    // The corrected point does not become the reference for the order check.
+    EXPECT_THAT(Function({0, 0, 0.5f, 0.8f, 0.6f, 0.5f, 0.55f, 0.9f}, false).getPoints(),
+                ElementsAre(Point{0, 0}, Point{0.5f, 0.8f}, Point{0.6f, 0.8f}, Point{0.55f, 0.9f}));
+    EXPECT_THAT(Function({0.1f, 0.2f, 0.3f}, false).getPoints(), ElementsAre(Point{0.1f, 0.2f}));
+    const std::vector<Point> nan = Function({0.5f, 0.5f, NAN, 0.6f, 0.7f, NAN}, true).getPoints();
+    ASSERT_EQ(4u, nan.size());
+    EXPECT_TRUE(std::isnan(nan[2].x) && std::isnan(nan[3].y));
+    EXPECT_THAT(log.texts(),
+                ElementsAre("Warning: alpha function point is out of order! Ignoring (0.400000, "
+                            "0.900000)",
+                            "Warning: correction applied to non-increasing sequence of Y values "
+                            "used in alpha function settings! (0.600000, 0.500000) -> (0.600000, "
+                            "0.800000)",
+                            "Warning: odd number (3) of X-Y values used in alpha function "
+                            "settings! Ignoring last value (0.300000)"));
+}
+
+TEST(FunctionTest, evaluatesSegmentsAndClampsOutsideThemWithAWarning) {
+    LogCapture log(1);
+    const Function curve({0, 0, 0.2f, 0, 0.8f, 1, 1, 1}, true);
+    EXPECT_EQ(0.5f, curve.getY(0.5f));
+    EXPECT_EQ(0.0f, curve.getY(0.1f));
+    EXPECT_EQ(0.0f, curve.getY(-0.1f));
+    // The end of the last segment is outside it: exactly 1 is clamped too, with the warning.
+    EXPECT_EQ(1.0f, curve.getY(1.0f));
+    EXPECT_EQ(1.0f, curve.getY(NAN));
+    EXPECT_THAT(log.texts(),
+                ElementsAre("Warning: alpha input -0.100000 out of range in alpha function "
+                            "settings! Returning clamped value 0.000000",
+                            "Warning: alpha input 1.000000 out of range in alpha function "
+                            "settings! Returning clamped value 1.000000",
+                            "Warning: alpha input nan out of range in alpha function "
+                            "settings! Returning clamped value 1.000000"));
+
+    EXPECT_EQ(0.3f, Function({}, false).getY(0.3f));  // no points: the identity
+    EXPECT_EQ(0.25f, Function({0.5f, 0.25f}, false).getY(0.0f));
+}
+
 struct Word {
     Word(int32_t value) : bits(static_cast<uint32_t>(value)) {}
     Word(float value) { memcpy(&bits, &value, sizeof(bits)); }
@@ -84,7 +125,7 @@ TEST_F(SettingsControllerTest, unknownUidsWriteNothingAndUidZeroTakesOnlyTheTuna
     EXPECT_TRUE(InterpolationGui::getInstance().mSettingsControllerCreated);
 
     LogCapture log(0);
-    EXPECT_FALSE(update(0, {2, 0, 30, 9, 3}));
+    EXPECT_FALSE(update(0, {-1, 100, 5}));  // a negative count reads nothing
     EXPECT_TRUE(update(0, {6, 100, 2, 101, 7, 102, 48, 115, 5, 116, 1, 0, 30}));
     EXPECT_EQ(2, logLevel);
     EXPECT_EQ(7, queueSize);
@@ -96,7 +137,6 @@ TEST_F(SettingsControllerTest, unknownUidsWriteNothingAndUidZeroTakesOnlyTheTuna
     EXPECT_FALSE(applyDelayToFrames);
     update(0, {4, 101, -1, 102, 64, 115, 0, 116, 0});  // back to the initial values
 
-    // Both entries hold the defaults: uid 0 kept nothing of its messages.
     EXPECT_FALSE(mController->writeSettings(0, nullptr));
     EXPECT_EQ(written(mUid), written(0));
     EXPECT_STREQ(
@@ -120,7 +160,6 @@ TEST_F(SettingsControllerTest, fullMessageIsWrittenInIdOrderDumpedAndExportedAsP
             13, 4,     14, 10,    15, 90,     16, 20,     17, 100,    18, 90,     19, 3,
             20, 0,     21, 2, 0.5f, 0.25f, 0.9f, 1.0f,
             22, -2,    23, 0.5f,  24, 10,     25, 0.25f,  26, 30}));
-    // Bools as 0 or 1, and the curve as repaired.
     EXPECT_EQ(std::vector<Word>({
             0, 60,     1, 40,     2, 0,       3, 2.5f,    4, 0.95f,   5, 3,       6, 0.01f,
             7, 3,      8, 0,      9, 0,       10, 1.5f,   11, 1,      12, 1,      13, 4,
@@ -149,7 +188,6 @@ TEST_F(SettingsControllerTest, fullMessageIsWrittenInIdOrderDumpedAndExportedAsP
     ASSERT_TRUE(mController->settingsToPolicy(mUid, text));
     Json::Value policy, expected;
     ASSERT_TRUE(Json::Reader().parse(text.c_str() + 8, policy)) << text.c_str();
-    // Parsed back, so that keys, nesting and the kinds of value (int, real, bool) all compare.
     ASSERT_TRUE(Json::Reader().parse(R"({"game_fps_limit": 60, "enabled": true, "mode": 3,
         "smart_delay": false, "write_to_frametracker": false, "minimum_regal_stability": 0.5,
         "max_consecutive_gl_compositions": 10, "max_percent_gl_compositions": 0.25,
@@ -160,7 +198,6 @@ TEST_F(SettingsControllerTest, fullMessageIsWrittenInIdOrderDumpedAndExportedAsP
     EXPECT_EQ(expected, policy) << text.c_str();
 }
 
-// Whatever a parcel claims, it is read at once: past its end it reads as zeros.
 TEST_F(SettingsControllerTest, truncatedParcelReadsAsZerosInTimeBoundedByItsSize) {
     LogCapture log(1);
     ASSERT_TRUE(update(mUid, {3, 0, 60, 7, 3, 9, 2}));
@@ -170,8 +207,6 @@ TEST_F(SettingsControllerTest, truncatedParcelReadsAsZerosInTimeBoundedByItsSize
     EXPECT_EQ(32, stored(mUid).delayMs);
     EXPECT_EQ(eRetimeMode, stored(mUid).mode);
     EXPECT_EQ(2, stored(mUid).rfpsOffset);
-    ASSERT_TRUE(update(mUid, {-1, 0, 60}));  // a negative count reads nothing
-    EXPECT_EQ(0, stored(mUid).gameFpsLimit);
 
     // Missing pairs read as (0, 0), corrected here to (0, 5); one stands for all its repeats.
     log.clear();
@@ -200,7 +235,7 @@ TEST_F(SettingsControllerTest, changesWaitForALiveObserverOfTheirUidAndAreDelive
     EXPECT_THAT(log.texts(),
                 ElementsAre(testing::_, "Interpolation::SettingsController::Observer [" +
                                                 std::to_string(other->mUid) + "] onFirstRef"));
-    EXPECT_THAT(observer->mReceived, IsEmpty());  // not during subscribe
+    EXPECT_THAT(observer->mReceived, testing::IsEmpty());  // not during subscribe
     mController->notifyChanges();
     mController->notifyChanges();
     EXPECT_THAT(observer->mReceived, ElementsAre(45));
@@ -216,8 +251,7 @@ TEST_F(SettingsControllerTest, changesWaitForALiveObserverOfTheirUidAndAreDelive
     mController->notifyChanges();
     EXPECT_EQ(1, dead.get_refs()->getWeakCount());  // dropped by the notification
 
-    // Released as it is notified, as if on another thread: it may unsubscribe only after the
-    // notification has let the mutex go.
+    // Released as it is notified, as if on another thread: it unsubscribes once the mutex is free.
     sp<TestObserver> late = new TestObserver(mUid);
     wp<TestObserver> weak = late;
     late->mOnChanged = [&late] {
