@@ -3,8 +3,8 @@
 #include <atomic>
 #include <chrono>
 #include <future>
-#include <limits>
 #include <thread>
+#include <tuple>
 
 #include "TimedCallbackThread.h"
 #include "support/TestClock.h"
@@ -20,7 +20,7 @@ class TimedCallbackThreadTest : public testing::Test {
 protected:
     void arm(nsecs_t period, nsecs_t now) {
         mThread.timer.arm(
-                period, now, [this] { mFires++; }, /*once=*/false);
+                period, now, [this] { mFires++; }, false);
     }
 
     TimedCallbackThread mThread;
@@ -31,85 +31,55 @@ protected:
 // Runs on the test's own thread with the test clock: the timer is always due, so nothing waits.
 TEST_F(TimedCallbackThreadTest, stalledScheduleCatchesUpAtMostOneSecondAcrossCycles) {
     test::TestClock clock(100'000 * MS);
-    for (bool catchUp : {false, true}) {
-        arm(100 * MS, clock.now());
-        mThread.timer.nextTime = clock.now() - 10'000 * MS;  // ten seconds behind
+    mThread.cycleCallback = [&] {
+        mCycles++;
+        std::lock_guard lock(mThread.mutex);
+        if (mThread.timer.nextTime >= clock.now()) mThread.running = false;
+    };
+    // Ten seconds behind. Without catch-up one firing per cycle, the schedule pulled up to one
+    // second behind; with it every missed period fires in the one check, before the clamp.
+    for (auto [catchUp, fires, cycles] : {std::tuple{false, 11, 11}, std::tuple{true, 100, 1}}) {
+        arm(100 * MS, clock.now() - 10'100 * MS);
         mThread.timer.catchUp = catchUp;
         mThread.running = true;
-        mFires = 0;
-        mCycles = 0;
-        mThread.cycleCallback = [&] {
-            mCycles++;
-            std::lock_guard lock(mThread.mutex);
-            if (mThread.timer.nextTime >= clock.now()) mThread.running = false;
-        };
+        mFires = mCycles = 0;
         mThread.threadLoop();
-        if (catchUp) {
-            // Catch-up inside one check is not clamped: every missed period fires.
-            EXPECT_EQ(100, mFires);
-            EXPECT_EQ(1, mCycles);
-        } else {
-            // One firing per cycle, and the schedule is pulled up to one second behind.
-            EXPECT_EQ(11, mFires);
-            EXPECT_EQ(11, mCycles);
-        }
+        EXPECT_EQ(fires, mFires);
+        EXPECT_EQ(cycles, mCycles);
     }
-}
-
-TEST_F(TimedCallbackThreadTest, runsOneCycleWhenDisabledOrNotRunning) {
-    test::TestClock clock(100'000 * MS);
-    mThread.cycleCallback = [&] { mCycles++; };
+    // A disabled timer runs one cycle and leaves its schedule alone.
     mThread.timer.period = 0;
     mThread.timer.nextTime = 0;
-    mThread.threadLoop();
-    EXPECT_EQ(1, mCycles);
-    EXPECT_EQ(0, mFires);
-    EXPECT_EQ(0, mThread.timer.nextTime);  // a disabled timer's schedule is left alone
-
-    arm(MS, clock.now() - 2 * MS);
-    mThread.running = false;
+    mThread.running = true;
     mThread.threadLoop();
     EXPECT_EQ(2, mCycles);
-    EXPECT_EQ(1, mFires);
+    EXPECT_EQ(100, mFires);
+    EXPECT_EQ(0, mThread.timer.nextTime);
 }
 
-TEST_F(TimedCallbackThreadTest, sleepsUntilEachDueTime) {
-    constexpr nsecs_t period = 5 * MS;
-    arm(period, systemTime(SYSTEM_TIME_MONOTONIC));
+TEST_F(TimedCallbackThreadTest, sleepsUntilEachDueTimeAndUntilNotifiedWhenNoneIsReachable) {
+    arm(5 * MS, systemTime(SYSTEM_TIME_MONOTONIC));
     mThread.cycleCallback = [&] {
-        if (++mCycles == 3) mThread.requestExit();
+        std::lock_guard lock(mThread.mutex);
+        if (++mCycles == 3) mThread.timer.nextTime = INT64_MAX;  // its deadline would overflow
     };
-    const auto start = std::chrono::steady_clock::now();
-    std::thread thread([&] { mThread.threadLoop(); });
-    thread.join();
-    EXPECT_GE(std::chrono::steady_clock::now() - start, std::chrono::nanoseconds(3 * period));
-    EXPECT_EQ(3, mFires);
-    EXPECT_EQ(3, mCycles);
-}
-
-TEST_F(TimedCallbackThreadTest, waitsUntilNotifiedForNegativeOrUnreachableDueTimes) {
-    struct Schedule {
-        nsecs_t nextTime;
-        nsecs_t slack;
-    };
-    // A negative due time that the slack keeps from being due, and one whose deadline overflows.
-    for (Schedule schedule : {Schedule{-1, std::numeric_limits<nsecs_t>::min()},
-                              Schedule{std::numeric_limits<nsecs_t>::max(), 0}}) {
-        arm(MS, 0);
-        mThread.timer.nextTime = schedule.nextTime;
-        mThread.timer.slack = schedule.slack;
-        mThread.running = true;
-        mCycles = 0;
-        mThread.cycleCallback = [&] { mCycles++; };
-        auto done = std::async(std::launch::async, [&] { mThread.threadLoop(); });
-
-        EXPECT_EQ(std::future_status::timeout, done.wait_for(30ms));
-        EXPECT_EQ(0, mCycles);
-        mThread.requestExit();
-        EXPECT_EQ(std::future_status::ready, done.wait_for(2s));
-        EXPECT_EQ(1, mCycles);
-        EXPECT_EQ(0, mFires);
+    auto done = std::async(std::launch::async, [&] { mThread.threadLoop(); });
+    while (mCycles < 3)
+        std::this_thread::sleep_for(1ms);
+    EXPECT_EQ(std::future_status::timeout, done.wait_for(30ms));
+    {
+        // A negative due time, which the slack keeps from being due.
+        std::lock_guard lock(mThread.mutex);
+        mThread.timer.nextTime = -1;
+        mThread.timer.slack = INT64_MIN;
     }
+    mThread.condition.notify_all();
+    EXPECT_EQ(std::future_status::timeout, done.wait_for(30ms));
+    EXPECT_EQ(3, mCycles);
+    mThread.requestExit();
+    EXPECT_EQ(std::future_status::ready, done.wait_for(2s));
+    EXPECT_EQ(3, mFires);
+    EXPECT_EQ(4, mCycles);
 }
 
 }  // namespace

@@ -17,39 +17,24 @@ namespace android::Interpolation {
 namespace {
 
 using testing::ElementsAre;
-using testing::IsEmpty;
 
-std::shared_ptr<FenceTime> signalledAt(nsecs_t t) {
-    return std::make_shared<FenceTime>(Fence::createSignalled(t));
+std::shared_ptr<FenceTime> fenceTime(sp<Fence> fence) {
+    return std::make_shared<FenceTime>(fence);
 }
 
 class CallbackReceiver : public EventDispatcher::EventReceiver {
 public:
-    explicit CallbackReceiver(std::function<void(nsecs_t)> callback) : mCallback(callback) {}
-    void onEvent(const EventType&, const nsecs_t& time, const EventData&) override {
-        mCallback(time);
-    }
+    explicit CallbackReceiver(std::function<void()> callback) : mCallback(callback) {}
+    void onEvent(const EventType&, const nsecs_t&, const EventData&) override { mCallback(); }
 
 private:
-    std::function<void(nsecs_t)> mCallback;
+    std::function<void()> mCallback;
 };
 
 class FrameTimingsAggregatorTest : public testing::Test {
 protected:
     FrameTimingsAggregatorTest() {
         EventDispatcher::subscribe(mUid, EventDispatcher::ALL_EVENTS, mEvents);
-    }
-    ~FrameTimingsAggregatorTest() override {
-        EventDispatcher::unsubscribe(mUid, EventDispatcher::ALL_EVENTS, mEvents);
-    }
-
-    std::vector<nsecs_t> eventTimes() const {
-        std::vector<nsecs_t> times;
-        for (const auto& event : mEvents->events()) {
-            EXPECT_EQ(mSlot, std::get<int>(event.data));
-            times.push_back(event.time);
-        }
-        return times;
     }
 
     std::vector<FrameTimings> newest(uint32_t count) {
@@ -68,39 +53,54 @@ protected:
     const uint32_t mUid = test::nextTestUid();
     sp<FrameTimingsAggregator> mTimings = new FrameTimingsAggregator(mUid);
     sp<test::RecordingReceiver> mEvents = new test::RecordingReceiver();
-    int mSlot = 3;
 };
 
 TEST_F(FrameTimingsAggregatorTest, recordsEveryStageOfAValidSlotAndAnnouncesItAtItsTime) {
     for (int slot : {-1, 64, INT_MIN}) {
         mTimings->dequeueTimings(1, slot);
         mTimings->queueTimings(2, slot);
-        mTimings->acquireFenceTimings(signalledAt(3), slot);
+        mTimings->acquireFenceTimings(fenceTime(Fence::createSignalled(3)), slot);
         mTimings->frameNumberForIndex(4, slot);
         mTimings->releaseBufferTimings(5, slot);
     }
     sp<Fence> acquire = Fence::createPending();
     mTimings->requestTiming(100);
-    mTimings->dequeueTimings(110, mSlot);
-    mTimings->frameNumberForIndex(7, mSlot);
-    mTimings->queueTimings(150, mSlot);
-    mTimings->acquireFenceTimings(std::make_shared<FenceTime>(acquire), mSlot);
-    mTimings->receivedFrameTimings(160, mSlot);
-    mTimings->compositionTimings(170, mSlot);
-    mTimings->presentFenceTimings(signalledAt(180), mSlot);
-    mTimings->releaseFrameTimings(190, mSlot);
-    acquire->signal(155);
-    mTimings->releaseBufferTimings(200, mSlot);
+    mTimings->dequeueTimings(110, 3);
+    mTimings->frameNumberForIndex(7, 3);
+    mTimings->queueTimings(150, 3);
+    mTimings->acquireFenceTimings(fenceTime(acquire), 3);
+    mTimings->receivedFrameTimings(160, 3);
+    mTimings->compositionTimings(170, 3);
+    mTimings->presentFenceTimings(FenceTime::NO_FENCE, 3);  // signal time -1
+    mTimings->releaseFrameTimings(190, 3);
+    {
+        // Pending and invalid fences stay attached; a signalled one is taken, and announced, once.
+        test::TraceCapture trace;
+        mTimings->checkFenceTimes(3);
+        EXPECT_EQ(-1, newest(1).at(0).mAcquireTime);
+        acquire->signal(155);
+        mTimings->checkFenceTimes(3);
+        mTimings->checkFenceTimes(3);
+        EXPECT_THAT(trace.events(), ElementsAre("B|checkFenceTimes", "E", "B|checkFenceTimes", "E",
+                                                "B|checkFenceTimes", "E"));
+    }
+    EXPECT_EQ(FenceTime::NO_FENCE, newest(1).at(0).mPresentFence);
+    mTimings->presentFenceTimings(fenceTime(Fence::createSignalled(180)), 3);
+    mTimings->releaseBufferTimings(200, 3);  // polls the fences first
 
     EXPECT_THAT(mEvents->types(),
                 ElementsAre(eBufferRequestedEvent, eBufferDequeuedEvent, eBufferQueuedEvent,
                             eBufferCompletedEvent, eBufferDisplayedEvent, eBufferReleasedEvent));
-    EXPECT_THAT(eventTimes(), ElementsAre(100, 110, 150, 155, 180, 200));
-
-    FrameTimings out[2];
+    std::vector<nsecs_t> times;
+    for (const auto& event : mEvents->events()) {
+        EXPECT_EQ(3, std::get<int>(event.data));
+        times.push_back(event.time);
+    }
+    EXPECT_THAT(times, ElementsAre(100, 110, 150, 155, 180, 200));
     // Once, from the history: the slot was reset, and nothing else was recorded.
-    ASSERT_EQ(1u, mTimings->getNewestFrameTimings(2, out));
-    const FrameTimings& t = out[0];
+    const std::vector<FrameTimings> all = newest(2);
+    ASSERT_EQ(1u, all.size());
+    const FrameTimings& t = all[0];
     EXPECT_EQ(7u, t.mFrameNumber);
     EXPECT_THAT((std::vector<nsecs_t>{t.mRequestTime, t.mDequeueTime, t.mQueueTime, t.mAcquireTime,
                                       t.mCompositionTime, t.mPresentTime, t.mReceivedTime,
@@ -108,36 +108,6 @@ TEST_F(FrameTimingsAggregatorTest, recordsEveryStageOfAValidSlotAndAnnouncesItAt
                 ElementsAre(100, 110, 150, 155, 170, 180, 160, 190, 200));
     EXPECT_EQ(nullptr, t.mAcquireFence);
     EXPECT_EQ(nullptr, t.mPresentFence);
-}
-
-TEST_F(FrameTimingsAggregatorTest, keepsPollingPendingAndInvalidFences) {
-    sp<Fence> acquire = Fence::createPending();
-    mTimings->dequeueTimings(10, mSlot);
-    mTimings->acquireFenceTimings(std::make_shared<FenceTime>(acquire), mSlot);
-    mTimings->presentFenceTimings(FenceTime::NO_FENCE, mSlot);  // signal time -1
-    mEvents->clear();
-    test::TraceCapture trace;
-
-    mTimings->checkFenceTimes(mSlot);
-    FrameTimings out;
-    ASSERT_EQ(1u, mTimings->getNewestFrameTimings(1, &out));
-    EXPECT_EQ(-1, out.mAcquireTime);
-    EXPECT_NE(nullptr, out.mAcquireFence);
-
-    acquire->signal(40);
-    mTimings->checkFenceTimes(mSlot);
-    mTimings->checkFenceTimes(mSlot);  // the signalled fence is gone: announced once
-    EXPECT_THAT(mEvents->types(), ElementsAre(eBufferCompletedEvent));
-    EXPECT_THAT(eventTimes(), ElementsAre(40));
-    EXPECT_THAT(trace.events(), ElementsAre("B|checkFenceTimes", "E", "B|checkFenceTimes", "E",
-                                            "B|checkFenceTimes", "E"));
-
-    // The invalid fence goes into the history still attached, shared rather than moved.
-    mTimings->releaseBufferTimings(50, mSlot);
-    ASSERT_EQ(1u, mTimings->getNewestFrameTimings(1, &out));
-    EXPECT_EQ(40, out.mAcquireTime);
-    EXPECT_EQ(-1, out.mPresentTime);
-    EXPECT_EQ(FenceTime::NO_FENCE, out.mPresentFence);
 }
 
 TEST_F(FrameTimingsAggregatorTest, reportsFramesInFlightByNewestDequeueThenTheNewestFinished) {
@@ -148,7 +118,6 @@ TEST_F(FrameTimingsAggregatorTest, reportsFramesInFlightByNewestDequeueThenTheNe
     mTimings->dequeueTimings(40, 0);
     EXPECT_THAT(newestDequeueTimes(8), ElementsAre(40, 30, 20, 10));
     EXPECT_THAT(newestDequeueTimes(2), ElementsAre(40, 30));
-
     FrameTimings untouched;
     EXPECT_EQ(0u, mTimings->getNewestFrameTimings(0, &untouched));
     EXPECT_FALSE(untouched.isValid());
@@ -166,24 +135,22 @@ TEST_F(FrameTimingsAggregatorTest, reportsFramesInFlightByNewestDequeueThenTheNe
     EXPECT_EQ(100, all[100].mReleaseBufferTime);
 }
 
+// The fence is announced with the mutex released, so the receiver can read the aggregator while
+// another thread releases the slot; that thread's own announcement waits for this broadcast.
 TEST_F(FrameTimingsAggregatorTest, countsARecordReleasedWhileItsFenceWasPolled) {
-    // The fence is announced with the aggregator's mutex released, so the receiver can read the
-    // aggregator while another thread releases the slot; that thread's own announcement waits for
-    // this broadcast to end.
     std::thread releaser;
-    auto released = [&] {
+    sp<CallbackReceiver> receiver = new CallbackReceiver([&] {
+        releaser = std::thread([&] { mTimings->releaseBufferTimings(90, 3); });
         String8 state;
-        mTimings->dump(state, "");
-        return strstr(state.c_str(), "inFlight=0 history=1/100") != nullptr;
-    };
-    sp<CallbackReceiver> receiver = new CallbackReceiver([&](nsecs_t) {
-        releaser = std::thread([&] { mTimings->releaseBufferTimings(90, mSlot); });
-        while (!released())
+        while (!strstr(state.c_str(), "inFlight=0 history=1/100")) {
             std::this_thread::sleep_for(std::chrono::milliseconds(1));
+            state.clear();
+            mTimings->dump(state, "");
+        }
     });
     EventDispatcher::subscribe(mUid, eBufferCompletedEvent, receiver);
-    mTimings->dequeueTimings(10, mSlot);
-    mTimings->acquireFenceTimings(signalledAt(50), mSlot);
+    mTimings->dequeueTimings(10, 3);
+    mTimings->acquireFenceTimings(fenceTime(Fence::createSignalled(50)), 3);
 
     test::LogCapture log(2);
     FrameTimings out[3];
@@ -192,7 +159,6 @@ TEST_F(FrameTimingsAggregatorTest, countsARecordReleasedWhileItsFenceWasPolled) 
     EXPECT_FALSE(out[0].isValid());
     EXPECT_EQ(90, out[1].mReleaseBufferTime);
     EXPECT_EQ(1, log.count("DistributionBasedLRDelayer Invalid FrameTimings!"));
-    EventDispatcher::unsubscribe(mUid, eBufferCompletedEvent, receiver);
 }
 
 }  // namespace
