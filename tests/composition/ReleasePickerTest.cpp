@@ -5,15 +5,20 @@
 #include <functional>
 #include <future>
 #include <limits>
+#include <thread>
 
 #include "FillInReleasePicker.h"
-#include "FrameTimings.h"
 #include "JustInTimeReleasePicker.h"
+#include "MLLatencyReductionReleasePicker.h"
 #include "NoInterpReleasePicker.h"
 #include "RetimeReleasePicker.h"
+#include "Settings.h"
 #include "UnlimitedReleasePicker.h"
+#include "support/FrameHistory.h"
 #include "support/Frames.h"
 #include "support/LogCapture.h"
+#include "support/RecordingReceiver.h"
+#include "support/TestClock.h"
 
 namespace android::Interpolation {
 namespace {
@@ -24,6 +29,8 @@ using test::LogCapture;
 using test::makeFrame;
 using testing::ElementsAre;
 
+constexpr nsecs_t MS = 1'000'000;
+
 RenderState stateOf(std::initializer_list<nsecs_t> ids) {
     RenderState state;
     for (nsecs_t id : ids)
@@ -33,9 +40,9 @@ RenderState stateOf(std::initializer_list<nsecs_t> ids) {
 
 class ReleasePickerTest : public testing::Test {
 protected:
-    template <typename Picker>
-    sp<ReleasePicker> make() {
-        return new Picker(mList, mName, mUid);
+    sp<ReleasePicker> picker(uint32_t mode) {
+        return ReleasePicker::newPickerFromMode(mList, mTimings, mName, mUid,
+                                                static_cast<InterpolationMode>(mode));
     }
 
     void queue(std::initializer_list<nsecs_t> ids) {
@@ -43,8 +50,8 @@ protected:
             mList->insertFrame(makeFrame(id));
     }
 
-    void compose(const sp<ReleasePicker>& picker, std::initializer_list<nsecs_t> ids) {
-        picker->onEvent(eBufferComposedEvent, 0, stateOf(ids));
+    void broadcast(EventType type, const EventData& data) {
+        EventDispatcher::broadcastEvent(mUid, type, systemTime(SYSTEM_TIME_MONOTONIC), data);
     }
 
     const uint32_t mUid = test::nextTestUid();
@@ -54,67 +61,61 @@ protected:
 };
 
 TEST_F(ReleasePickerTest, factoryMapsModesToPolicies) {
-    auto pickerFor = [&](uint32_t mode) {
-        return ReleasePicker::newPickerFromMode(mList, mTimings, mName, mUid,
-                                                static_cast<InterpolationMode>(mode));
-    };
-    EXPECT_NE(nullptr, dynamic_cast<RetimeReleasePicker*>(pickerFor(0).get()));
-    EXPECT_NE(nullptr, dynamic_cast<FillInReleasePicker*>(pickerFor(1).get()));
-    EXPECT_NE(nullptr, dynamic_cast<NoInterpReleasePicker*>(pickerFor(2).get()));
-    EXPECT_NE(nullptr, dynamic_cast<JustInTimeReleasePicker*>(pickerFor(3).get()));
-    EXPECT_NE(nullptr, dynamic_cast<UnlimitedReleasePicker*>(pickerFor(4).get()));
-    EXPECT_NE(nullptr, dynamic_cast<RetimeReleasePicker*>(pickerFor(6).get()));
+    EXPECT_NE(nullptr, dynamic_cast<RetimeReleasePicker*>(picker(0).get()));
+    EXPECT_NE(nullptr, dynamic_cast<FillInReleasePicker*>(picker(1).get()));
+    EXPECT_NE(nullptr, dynamic_cast<NoInterpReleasePicker*>(picker(2).get()));
+    EXPECT_NE(nullptr, dynamic_cast<JustInTimeReleasePicker*>(picker(3).get()));
+    EXPECT_NE(nullptr, dynamic_cast<UnlimitedReleasePicker*>(picker(4).get()));
+    EXPECT_NE(nullptr, dynamic_cast<MLLatencyReductionReleasePicker*>(picker(5).get()));
+    EXPECT_NE(nullptr, dynamic_cast<RetimeReleasePicker*>(picker(6).get()));
 }
 
 TEST_F(ReleasePickerTest, displayedPolicyReleasesOnceTheComposedMeanReachesTheOldestFrame) {
-    for (sp<ReleasePicker> picker :
-         {make<NoInterpReleasePicker>(), make<UnlimitedReleasePicker>()}) {
+    for (uint32_t mode : {eNoInterpMode, eUnlimitedMode}) {
+        sp<ReleasePicker> displayed = picker(mode);
         mList->clearEveryFrame();
-        queue({7, 20});
-        compose(picker, {5, 8});  // mean 2 + 4 = 6
-        EXPECT_EQ(ReleaseChoice::WAIT_FOR_EVENT, picker->tryRelease().action);
-        compose(picker, {5, 10});  // mean 2 + 5 = 7
-        const ReleaseChoice choice = picker->tryRelease();
+        queue({8, 20});
+        broadcast(eBufferComposedEvent, stateOf({5, 11}));  // 5/2 + 11/2 = 7, not 16/2
+        EXPECT_EQ(ReleaseChoice::WAIT_FOR_EVENT, displayed->tryRelease().action);
+        broadcast(eBufferComposedEvent, stateOf({5, 12}));  // 2 + 6 = 8
+        const ReleaseChoice choice = displayed->tryRelease();
         EXPECT_EQ(ReleaseChoice::RELEASE, choice.action);
-        EXPECT_EQ(7, choice.frame.mID);
+        EXPECT_EQ(8, choice.frame.mID);
     }
-}
-
-TEST_F(ReleasePickerTest, displayedPolicyOnAnEmptyQueueReturnsTheEmptyFrameAtOnce) {
-    sp<ReleasePicker> picker = make<NoInterpReleasePicker>();
-    const auto start = steady_clock::now();
-    EXPECT_TRUE(picker->selectFrameForRelease().isEmpty());
+    mList->clearEveryFrame();
+    const auto start = steady_clock::now();  // an empty queue: the empty frame at once
+    EXPECT_TRUE(picker(eNoInterpMode)->selectFrameForRelease().isEmpty());
     EXPECT_LT(steady_clock::now() - start, 20ms);
 }
 
 TEST_F(ReleasePickerTest, fillInHoldsFourFramesWhateverTheCapacity) {
-    sp<ReleasePicker> picker = make<FillInReleasePicker>();
-    picker->setFrameListCapacity(2);
+    sp<ReleasePicker> fillIn = picker(eFillInMode);
+    fillIn->setFrameListCapacity(2);
     queue({10, 20, 30});
-    EXPECT_EQ(ReleaseChoice::WAIT_FOR_EVENT, picker->tryRelease().action);
+    EXPECT_EQ(ReleaseChoice::WAIT_FOR_EVENT, fillIn->tryRelease().action);
     queue({40});
-    EXPECT_EQ(10, picker->tryRelease().frame.mID);
+    EXPECT_EQ(10, fillIn->tryRelease().frame.mID);
 }
 
 TEST_F(ReleasePickerTest, retimeReleasesOnlyWithTwoFramesAtOrBeforeItsUnadvancedDisplayTime) {
-    sp<ReleasePicker> picker = make<RetimeReleasePicker>();
+    sp<ReleasePicker> retime = picker(eRetimeMode);
     queue({10, 20, 30});
-    compose(picker, {20, 30});
-    EXPECT_EQ(ReleaseChoice::WAIT_FOR_EVENT, picker->tryRelease().action);
+    broadcast(eBufferComposedEvent, stateOf({20, 30}));
+    EXPECT_EQ(ReleaseChoice::WAIT_FOR_EVENT, retime->tryRelease().action);
     queue({-20, -10});  // the upcoming display time stays 0
-    EXPECT_EQ(-20, picker->tryRelease().frame.mID);
+    EXPECT_EQ(-20, retime->tryRelease().frame.mID);
 }
 
 TEST_F(ReleasePickerTest, logsEachPolicyStepAndEveryEventIssue) {
-    sp<ReleasePicker> picker = make<NoInterpReleasePicker>();
+    sp<ReleasePicker> noInterp = picker(eNoInterpMode);
     queue({10});
     LogCapture log(2);
-    picker->onEvent(eCompositionEstimateEvent, 0, nsecs_t{500});
-    picker->onEvent(eBufferComposedEvent, 0, 3);
-    picker->onEvent(eCompositionEstimateEvent, 0, 3);
-    picker->onEvent(eDelayChangedEvent, 0, nsecs_t{1});
-    compose(picker, {4, 6});
-    picker->tryRelease();
+    noInterp->onEvent(eCompositionEstimateEvent, 0, nsecs_t{500});
+    noInterp->onEvent(eBufferComposedEvent, 0, 3);
+    noInterp->onEvent(eCompositionEstimateEvent, 0, 3);
+    noInterp->onEvent(eDelayChangedEvent, 0, nsecs_t{1});
+    noInterp->onEvent(eBufferComposedEvent, 0, stateOf({4, 6}));
+    noInterp->tryRelease();
     EXPECT_THAT(log.texts(),
                 ElementsAre("ReleasePicker::onEvent 2097152 received",
                             "ReleasePicker::onEvent 1048576 received",
@@ -189,7 +190,7 @@ TEST_F(ReleasePickerWaitTest, handledEventsWakeTheWaiter) {
     for (EventType wakeUp : {eFrameReceivedEvent, eBufferComposedEvent, eCompositionEstimateEvent}) {
         sp<ScriptedPicker> picker = waitThenRelease();
         auto selection = selectAsync(picker.get());
-        EventDispatcher::broadcastEvent(mUid, wakeUp, 0, RenderState{});  // payload may be wrong
+        broadcast(wakeUp, RenderState{});  // the payload may be the wrong one
         EXPECT_EQ(10, selection.get().mID) << wakeUp;
     }
 }
@@ -236,6 +237,155 @@ TEST_F(ReleasePickerWaitTest, tearDownReleasesAWaiterWithTheEmptyFrame) {
     // The selection has left the picker; its result reaches the future a moment later.
     ASSERT_EQ(std::future_status::ready, selection.wait_for(100ms));
     EXPECT_TRUE(selection.get().isEmpty());
+}
+
+class JustInTimeReleasePickerTest : public ReleasePickerTest {
+protected:
+    void setMargin(int32_t marginMs) {
+        Settings settings;
+        settings.justInTimeMarginMs = static_cast<uint32_t>(marginMs);
+        mPicker->onSettingsChanged(settings);
+    }
+
+    void composeAt(nsecs_t compositionTime, std::initializer_list<nsecs_t> shown) {
+        mPicker->onEvent(eBufferComposedEvent, 0, stateOf(shown));
+        mPicker->onEvent(eCompositionEstimateEvent, 0, compositionTime);
+    }
+
+    sp<JustInTimeReleasePicker> mPicker = new JustInTimeReleasePicker(mList, mName, mUid);
+};
+
+TEST_F(JustInTimeReleasePickerTest, releasesAtOnceWhenTheQueueIsFullAndTheNewestFrameIsOnScreen) {
+    queue({10, 20});
+    composeAt(0, {20});
+    EXPECT_EQ(ReleaseChoice::WAIT_FOR_EVENT, mPicker->tryRelease().action);
+    mPicker->setFrameListCapacity(2);
+    const ReleaseChoice choice = mPicker->tryRelease();
+    EXPECT_EQ(ReleaseChoice::RELEASE, choice.action);
+    EXPECT_EQ(10, choice.frame.mID);
+
+    setMargin(4);  // with the composition past, only a newest frame not acquired holds the queue
+    mList->insertFrame(makeFrame(30, /*acquired=*/false));
+    EXPECT_EQ(ReleaseChoice::WAIT_FOR_EVENT, mPicker->tryRelease().action);
+}
+
+TEST_F(JustInTimeReleasePickerTest, otherwiseWaitsUntilTheMarginBeforeTheComposition) {
+    test::TestClock clock(1'000'000'000);
+    queue({10, 20, 30});
+    composeAt(clock.now() + 10 * MS, {20});
+    EXPECT_EQ(ReleaseChoice::WAIT_FOR_EVENT, mPicker->tryRelease().action);  // no margin yet
+
+    setMargin(4);
+    const ReleaseChoice wait = mPicker->tryRelease();
+    EXPECT_EQ(ReleaseChoice::WAIT_FOR_TIME, wait.action);
+    EXPECT_EQ(6 * MS, wait.waitTime);
+
+    clock.advance(7 * MS);  // 3 ms left, inside the margin
+    EXPECT_EQ(10, mPicker->tryRelease().frame.mID);
+    clock.advance(10 * MS);  // the composition is past
+    EXPECT_EQ(10, mPicker->attempEarlyRelease().frame.mID);
+
+    setMargin(-1);  // the field is unsigned on the wire, signed in use: -1 ms
+    composeAt(clock.now(), {20});
+    const ReleaseChoice late = mPicker->attempEarlyRelease();
+    EXPECT_EQ(ReleaseChoice::WAIT_FOR_TIME, late.action);
+    EXPECT_EQ(1 * MS, late.waitTime);
+}
+
+TEST_F(JustInTimeReleasePickerTest, selectionWakesAtTheMarginBeforeTheComposition) {
+    setMargin(5);
+    queue({10, 20, 30});
+    const auto start = steady_clock::now();
+    composeAt(systemTime(SYSTEM_TIME_MONOTONIC) + 20 * MS, {20});
+    EXPECT_EQ(10, mPicker->selectFrameForRelease().mID);
+    const auto waited = steady_clock::now() - start;
+    EXPECT_GE(waited, 15ms);
+    EXPECT_LT(waited, 60ms);
+}
+
+class MLLatencyReductionReleasePickerTest : public ReleasePickerTest {
+protected:
+    MLLatencyReductionReleasePickerTest() {
+        // A game rendering in 1 ms whose buffers come back 2 ms before they are dequeued.
+        test::addSteadyFrames(*mTimings, 1, 30, 1 * MS, 2 * MS);
+        EventDispatcher::subscribe(mUid, eReleaseDelayed, mDelays);
+    }
+    ~MLLatencyReductionReleasePickerTest() override {
+        EventDispatcher::unsubscribe(mUid, eReleaseDelayed, mDelays);
+    }
+
+    sp<test::RecordingReceiver> mDelays = new test::RecordingReceiver();
+    sp<ReleasePicker> mPicker = picker(eLatencyReductionMode);
+};
+
+TEST_F(MLLatencyReductionReleasePickerTest, frameArrivalsReachTheBaseTwiceUntilTheLastReference) {
+    LogCapture log(2);
+    broadcast(eFrameReceivedEvent, makeFrame(10));
+    broadcast(eBufferComposedEvent, stateOf({10}));
+    EXPECT_EQ(2, log.count("ReleasePicker::onEvent 1 received"));
+    EXPECT_EQ(1, log.count("ReleasePicker::onEvent 1048576 received"));
+
+    // Both entries leave with the picker: no dead entry is met afterwards.
+    mPicker.clear();
+    log.clear();
+    broadcast(eFrameReceivedEvent, makeFrame(20));
+    broadcast(eBufferComposedEvent, stateOf({20}));
+    EXPECT_THAT(log.texts(), testing::IsEmpty());
+}
+
+TEST_F(MLLatencyReductionReleasePickerTest, releasesOnceTheNewestIsOnScreenAfterThePredictedSleep) {
+    // Four buffers, also for the delayer: a buffer now comes back 12 ms before its next dequeue.
+    mPicker->setFrameListCapacity(4);
+    queue({10, 20, 30});
+    EXPECT_EQ(ReleaseChoice::WAIT_FOR_EVENT, mPicker->tryRelease().action);
+    mList->insertFrame(makeFrame(40, /*acquired=*/false));
+    broadcast(eBufferComposedEvent, stateOf({30, 40}));
+    EXPECT_EQ(ReleaseChoice::WAIT_FOR_EVENT, mPicker->tryRelease().action);
+    mList->insertFrame(makeFrame(40));
+    broadcast(eBufferComposedEvent, stateOf({30}));
+    EXPECT_EQ(ReleaseChoice::WAIT_FOR_EVENT, mPicker->tryRelease().action);
+    EXPECT_THAT(mDelays->events(), testing::IsEmpty());  // no sleep either
+
+    // 20 ms ahead, less the 12 ms margin (the first render-time estimate is 0): up to 8 ms.
+    broadcast(eBufferComposedEvent, stateOf({30, 40}));
+    broadcast(eCompositionEstimateEvent, systemTime(SYSTEM_TIME_MONOTONIC) + 20 * MS);
+    const auto start = steady_clock::now();
+    EXPECT_EQ(10, mPicker->selectFrameForRelease().mID);
+    const auto elapsed = steady_clock::now() - start;
+    ASSERT_EQ(1u, mDelays->events().size());
+    const nsecs_t delay = std::get<nsecs_t>(mDelays->events()[0].data);
+    EXPECT_GT(delay, 0);
+    EXPECT_LE(delay, 8 * MS);
+    EXPECT_GE(elapsed, std::chrono::microseconds(delay / 1000));
+    EXPECT_LT(elapsed, std::chrono::nanoseconds(delay) + 100ms);
+
+    // A composition already due: no sleep.
+    broadcast(eCompositionEstimateEvent, systemTime(SYSTEM_TIME_MONOTONIC) - 1 * MS);
+    EXPECT_EQ(10, mPicker->selectFrameForRelease().mID);
+    EXPECT_EQ(0, std::get<nsecs_t>(mDelays->events().back().data));
+}
+
+TEST_F(MLLatencyReductionReleasePickerTest, compositionDuringTheSleepNeitherWaitsNorIsLost) {
+    queue({10, 20, 30});
+    broadcast(eBufferComposedEvent, stateOf({30}));
+    // The longest sleep, 16 ms.
+    broadcast(eCompositionEstimateEvent, systemTime(SYSTEM_TIME_MONOTONIC) + 100 * MS);
+
+    auto selection =
+            std::async(std::launch::async, [&] { return mPicker->selectFrameForRelease(); });
+    while (mDelays->events().empty())  // the delay is announced just before the sleep
+        std::this_thread::yield();
+    const auto start = steady_clock::now();
+    broadcast(eBufferComposedEvent, stateOf({40}));
+    EXPECT_LT(steady_clock::now() - start, 8ms);
+    ASSERT_EQ(std::future_status::ready, selection.wait_for(1s));
+    EXPECT_EQ(10, selection.get().mID);
+
+    // The host lets frame 10 go and queues 40; the picker saw 40 composed.
+    mList->clearOldestFrameLocking();
+    queue({40});
+    broadcast(eCompositionEstimateEvent, nsecs_t{0});
+    EXPECT_EQ(20, mPicker->selectFrameForRelease().mID);
 }
 
 }  // namespace

@@ -5,27 +5,10 @@
 #include <ui/FenceTime.h>
 #include <ui/GraphicBuffer.h>
 
-#include <cerrno>
-
 namespace android {
 namespace {
 
-bool isOpen(int fd) {
-    return fcntl(fd, F_GETFD) != -1 || errno != EBADF;
-}
-
-TEST(FenceTest, closesItsDescriptorWithTheLastReference) {
-    sp<Fence> fence = Fence::createPending();
-    const int fd = fence->get();
-    ASSERT_GE(fd, 0);
-    sp<Fence> second = fence;
-    fence.clear();
-    EXPECT_TRUE(isOpen(fd));
-    second.clear();
-    EXPECT_FALSE(isOpen(fd));
-}
-
-TEST(FenceTest, isPendingUntilSignalled) {
+TEST(FenceTest, signalsOnceAndClosesItsDescriptorWithTheLastReference) {
     sp<Fence> fence = Fence::createPending();
     auto fenceTime = std::make_shared<FenceTime>(fence);
     EXPECT_EQ(TIMED_OUT, fence->wait(0));
@@ -35,9 +18,14 @@ TEST(FenceTest, isPendingUntilSignalled) {
     EXPECT_EQ(NO_ERROR, fence->wait(0));
     EXPECT_EQ(NO_ERROR, fence->wait(-1));
     EXPECT_EQ(1234, fenceTime->getSignalTime());
-
     fence->signal(5678);  // a fence signals once
     EXPECT_EQ(1234, fence->getSignalTime());
+
+    const int fd = fence->get();
+    fence.clear();
+    EXPECT_NE(-1, fcntl(fd, F_GETFD));  // the FenceTime still holds the fence
+    fenceTime.reset();
+    EXPECT_EQ(-1, fcntl(fd, F_GETFD));
 }
 
 TEST(FenceTest, noFenceCountsAsSignalledButHasNoTime) {

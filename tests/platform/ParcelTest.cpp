@@ -9,12 +9,6 @@
 namespace android {
 namespace {
 
-std::vector<uint32_t> words(const Parcel& parcel) {
-    std::vector<uint32_t> words(parcel.dataSize() / 4);
-    memcpy(words.data(), parcel.data(), words.size() * 4);
-    return words;
-}
-
 TEST(ParcelTest, writesLittleEndianWordsAndPadsByteArrays) {
     Parcel parcel;
     parcel.writeInt32(-2);
@@ -24,9 +18,11 @@ TEST(ParcelTest, writesLittleEndianWordsAndPadsByteArrays) {
     const uint8_t bytes[] = {1, 2, 3, 4, 5};
     parcel.writeByteArray(sizeof(bytes), bytes);
 
+    std::vector<uint32_t> words(parcel.dataSize() / 4);
+    memcpy(words.data(), parcel.data(), words.size() * 4);
     EXPECT_EQ((std::vector<uint32_t>{0xfffffffe, 0x80000000, 7, 5, 0x3f800000, 5, 0x04030201,
                                      0x00000005}),
-              words(parcel));
+              words);
 
     parcel.setDataPosition(0);
     EXPECT_EQ(-2, parcel.readInt32());
@@ -39,12 +35,16 @@ TEST(ParcelTest, writesLittleEndianWordsAndPadsByteArrays) {
     EXPECT_EQ(parcel.dataSize(), parcel.dataPosition());
 }
 
-TEST(ParcelTest, readsPastTheEndGiveZeroAndStayAtTheEnd) {
+TEST(ParcelTest, refusesReadsPastTheEnd) {
     Parcel parcel;
-    const uint8_t data[] = {1, 0, 0, 0, 9, 9};  // one int32 and half of another
+    const uint8_t data[] = {0xff, 0xff, 0xff, 0x7f, 9, 9};  // the largest int32, half of another
     parcel.setData(data, sizeof(data));
+    std::vector<uint8_t> read;
+    EXPECT_EQ(NOT_ENOUGH_DATA, parcel.readByteVector(&read));  // far longer than the data
+    EXPECT_TRUE(read.empty());
+    EXPECT_EQ(std::numeric_limits<int32_t>::max(), parcel.readInt32());  // nothing was consumed
 
-    EXPECT_EQ(1, parcel.readInt32());
+    // Reads past the end give zero and stay at the end.
     EXPECT_EQ(0, parcel.readInt32());
     EXPECT_EQ(0, parcel.readInt64());
     EXPECT_EQ(0.0f, parcel.readFloat());
@@ -52,21 +52,9 @@ TEST(ParcelTest, readsPastTheEndGiveZeroAndStayAtTheEnd) {
     EXPECT_EQ(NOT_ENOUGH_DATA, parcel.readInt32(&value));
     EXPECT_EQ(0, value);
     EXPECT_EQ(4u, parcel.dataPosition());
-
     parcel.setDataPosition(1000);
     EXPECT_EQ(sizeof(data), parcel.dataPosition());
     EXPECT_EQ(0u, parcel.readUint32());
-}
-
-TEST(ParcelTest, byteArrayLongerThanTheDataIsRefused) {
-    Parcel parcel;
-    parcel.writeInt32(std::numeric_limits<int32_t>::max());
-    parcel.writeInt32(0);
-    parcel.setDataPosition(0);
-    std::vector<uint8_t> read;
-    EXPECT_EQ(NOT_ENOUGH_DATA, parcel.readByteVector(&read));
-    EXPECT_TRUE(read.empty());
-    EXPECT_EQ(0u, parcel.dataPosition());
 }
 
 }  // namespace
