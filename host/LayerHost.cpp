@@ -107,6 +107,8 @@ void LayerHost::releaseLoop(sp<ReleasePicker> picker) {
 }
 
 void LayerHost::recordReleases() {
+    // The release and composition threads both record; each batch is recorded by one of them.
+    std::lock_guard recording(mRecordingMutex);
     {
         std::lock_guard lock(mReleasedMutex);
         mReleasedScratch.swap(mReleasedSlots);

@@ -107,7 +107,8 @@ private:
     // listener cannot record them itself, since that broadcasts from inside a broadcast.
     std::mutex mReleasedMutex;
     std::vector<int> mReleasedSlots;  // guarded by mReleasedMutex
-    std::vector<int> mReleasedScratch;
+    std::mutex mRecordingMutex;
+    std::vector<int> mReleasedScratch;  // guarded by mRecordingMutex
 };
 
 // Delivers settings as the controlling service does: an updateSettings parcel for the uid, then
