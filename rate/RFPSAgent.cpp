@@ -116,9 +116,11 @@ void RFPSAgent::fakeVsync() {
 
 void RFPSAgent::fakeVsyncLocked() {
     mPresentNow = true;
-    if (--mResetVsyncClock > 0) return;
-    // Every RESET_VSYNC_CLOCK ticks, and then on every tick until it had to: a clock more than
-    // one period ahead of now is pulled back.
+    // Stays at 0 rather than counting down for ever, which would overflow in a long session.
+    if (mResetVsyncClock > 0) mResetVsyncClock--;
+    if (mResetVsyncClock > 0) return;
+    // From the RESET_VSYNC_CLOCK-th fake vsync on, each one checks that the clock has not run more
+    // than a period ahead of now, until it has to pull it back and the count starts again.
     const nsecs_t target = mPollTime + mFakeVsyncTimer.period;
     if (mFakeVsyncTimer.nextTime <= target) return;
     ILOG(2, "RFPSAgent::fakeVsync [%s] changeNext from %lu to %lu", mName.c_str(),
