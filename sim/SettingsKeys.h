@@ -35,4 +35,7 @@ Result<std::vector<host::SettingValue>> parseSettingsJson(std::string_view text,
                                                           std::string_view source);
 Result<std::vector<host::SettingValue>> readSettingsFile(const std::string& path);
 
+// "key=value" as --set takes it, for the record of a run's options.
+std::string describeSetting(const host::SettingValue& setting);
+
 }  // namespace verolux::sim
