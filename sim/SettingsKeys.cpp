@@ -364,6 +364,18 @@ Result<std::vector<SettingValue>> readSettingsFile(const std::string& path) {
     return parseSettingsJson(text.str(), path);
 }
 
+int32_t logLevelOf(const std::vector<SettingValue>& settings) {
+    constexpr int32_t LOG_LEVEL_ID = 100;
+    int32_t level = 0;
+    for (const SettingValue& setting : settings) {
+        if (const auto* value = std::get_if<int32_t>(&setting.value);
+            value != nullptr && setting.id == LOG_LEVEL_ID) {
+            level = *value;
+        }
+    }
+    return level;
+}
+
 std::string describeSetting(const SettingValue& setting) {
     std::string name = "id " + std::to_string(setting.id);
     for (const SettingKey& key : settingKeys()) {
