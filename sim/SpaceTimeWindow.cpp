@@ -64,28 +64,36 @@ SpaceTimeWindow::SpaceTimeWindow(nsecs_t from, nsecs_t to, size_t maxRows)
     : mFrom(from), mTo(to), mMaxRows(maxRows) {}
 
 void SpaceTimeWindow::onRefresh(const RefreshRecord& refresh) {
-    if (refresh.presentTime < mFrom || refresh.presentTime >= mTo || mRowCount == mMaxRows) return;
-    if (refresh.scanline.empty() || refresh.scanline.size() % 3 != 0) return;
-    if (mRowCount == 0) {
-        mFirstRefresh = refresh.index;
-        mWidth = refresh.scanline.size() / 3;
-        mRows.reserve(mMaxRows * mWidth * 3);
+    if (refresh.presentTime >= mTo || refresh.scanline.empty() || refresh.scanline.size() % 3 != 0) {
+        return;
     }
-    if (refresh.scanline.size() != mWidth * 3) return;
-    mRows.insert(mRows.end(), refresh.scanline.begin(), refresh.scanline.end());
-    mRowCount++;
+    if (refresh.presentTime >= mFrom && !mInWindow) {
+        mInWindow = true;
+        mRows.clear();
+    }
+    if (mInWindow && mRows.size() == mMaxRows) return;
+    if (!mRows.empty() && refresh.scanline.size() != mRows.front().scanline.size()) return;
+    mRows.push_back({refresh.index, refresh.presentTime, refresh.scanline});
+    // Before the window, only the latest stretch of its length is kept.
+    while (!mInWindow && (mRows.size() > mMaxRows ||
+                          mRows.front().presentTime <= refresh.presentTime - (mTo - mFrom))) {
+        mRows.pop_front();
+    }
 }
 
 Status SpaceTimeWindow::writePng(const std::string& path) const {
-    if (mRowCount == 0) {
-        return {errorLine("cannot draw " + path + ": no refresh fell in the picture's window")};
-    }
+    if (mRows.empty()) return {errorLine("cannot draw " + path + ": no refresh showed a picture")};
+    const size_t width = mRows.front().scanline.size() / 3;
+    std::vector<uint8_t> pixels;
+    pixels.reserve(mRows.size() * width * 3);
+    for (const Row& row : mRows)
+        pixels.insert(pixels.end(), row.scanline.begin(), row.scanline.end());
     FILE* file = fopen(path.c_str(), "wb");
     if (file == nullptr) return {errorLine("cannot write " + path + ": " + strerror(errno))};
-    std::string firstRefresh = std::to_string(mFirstRefresh);
-    std::string rowCount = std::to_string(mRowCount);
+    std::string firstRefresh = std::to_string(mRows.front().refresh);
+    std::string rowCount = std::to_string(mRows.size());
     PngErrors errors{};
-    const bool written = writeRows(file, mRows.data(), mWidth, mRowCount, firstRefresh.data(),
+    const bool written = writeRows(file, pixels.data(), width, mRows.size(), firstRefresh.data(),
                                    rowCount.data(), errors);
     const bool closed = fclose(file) == 0;
     if (written && closed) return {};

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <deque>
 #include <string>
 #include <vector>
 
@@ -10,7 +11,7 @@ namespace verolux::sim {
 
 // The rows of the space-time picture for a window of the run: the scanline on screen at each
 // refresh whose present time falls in [from, to), at most maxRows of them, so that a run of any
-// length keeps only the window.
+// length keeps only the window. A run that ends before `from` keeps its last to - from instead.
 class SpaceTimeWindow final : public RecordSink {
 public:
     SpaceTimeWindow(nsecs_t from, nsecs_t to, size_t maxRows);
@@ -23,13 +24,17 @@ public:
     Status writePng(const std::string& path) const;
 
 private:
+    struct Row {
+        uint64_t refresh;
+        nsecs_t presentTime;
+        std::vector<uint8_t> scanline;  // RGB
+    };
+
     const nsecs_t mFrom;
     const nsecs_t mTo;
     const size_t mMaxRows;
-    uint64_t mFirstRefresh = 0;
-    size_t mWidth = 0;           // pixels
-    std::vector<uint8_t> mRows;  // RGB
-    size_t mRowCount = 0;
+    bool mInWindow = false;
+    std::deque<Row> mRows;
 };
 
 }  // namespace verolux::sim

@@ -176,8 +176,9 @@ std::string motionFinding(const Summary& run, const Summary& reference) {
     if (*b < CLEARLY_BETTER * *a) verdict = "rougher than";
     return format(
             "Motion: %s without interpolation: 95 %% of refreshes within %.2f ms of even "
-            "motion, against %.2f ms in mode 2; %" PRIu64 " stutters against %" PRIu64 ".",
-            verdict, *a, *b, run.measured.stutterCount, reference.measured.stutterCount);
+            "motion, against %.2f ms in mode 2; %" PRIu64 " stutter%s against %" PRIu64 ".",
+            verdict, *a, *b, run.measured.stutterCount, run.measured.stutterCount == 1 ? "" : "s",
+            reference.measured.stutterCount);
 }
 
 std::string costFinding(const Summary& run, const Summary& reference) {

@@ -2,9 +2,7 @@
 #include <gtest/gtest.h>
 
 #include <functional>
-#include <sstream>
 
-#include "sim/CsvWriter.h"
 #include "sim/LayerRecorder.h"
 #include "sim/Measures.h"
 
@@ -160,52 +158,6 @@ TEST(LayerRecorderTest, namesWhatTheScreenShowedAndPassesFramesOnInOrder) {
     EXPECT_EQ(100, sink.frames[1].firstPresentTime);
     EXPECT_EQ(500, sink.frames[1].lastPresentTime);  // held and shown again
     EXPECT_EQ(600, sink.frames[1].releaseTime);
-}
-
-TEST(CsvTest, framesRefreshesAndPresentMonRowsHaveTheirColumns) {
-    FrameRecord f;
-    f.number = 7;
-    f.startTime = 1000 + 1 * MS;
-    f.dequeueTime = 1000 + 3 * MS;
-    f.queueTime = 1000 + 10 * MS;
-    f.renderDoneTime = 1000 + 14 * MS;
-    f.acquireTime = 1000 + 15 * MS;
-    f.firstPresentTime = 1000 + 30 * MS;
-    f.lastPresentTime = 1000 + 40 * MS;
-    f.releaseTime = 1000 + 45 * MS;
-    FrameRecord dropped;
-    dropped.number = 8;
-    dropped.queueTime = 1000 + 26 * MS;
-
-    std::ostringstream frames, refreshes, presentMon;
-    FramesCsv(frames, 1000).onFrame(f);
-    PresentMonCsv monitor(presentMon, 1000, "verolux-sim-run", 10001);
-    monitor.onFrame(f);
-    monitor.onFrame(dropped);
-    RefreshRecord r = refresh(3, HZ120, Picture::BLEND, 1000 + 20 * MS);
-    r.items[r.itemCount++] = {7, 1.0f, 0.75f};
-    r.items[r.itemCount++] = {8, 0.25f, 0.25f};
-    r.delay = 64 * MS;
-    r.cpuTime = 35'000;
-    RefreshesCsv(refreshes, 0).onRefresh(r);
-
-    EXPECT_EQ(
-            "frame,start_ns,queue_ns,render_done_ns,acquire_ns,first_present_ns,"
-            "last_present_ns,release_ns,dropped\n"
-            "7,1000000,10000000,14000000,15000000,30000000,40000000,45000000,0\n",
-            frames.str());
-    EXPECT_EQ(
-            "refresh,vsync_ns,present_ns,picture,frame0,alpha0,frame1,alpha1,content_ns,"
-            "delay_ns,cpu_ns\n"
-            "3,24999999,33333332,blend,7,1,8,0.25,20001000,64000000,35000\n",
-            refreshes.str());
-    EXPECT_EQ(
-            "Application,ProcessID,SwapChainAddress,Runtime,SyncInterval,PresentFlags,Dropped,"
-            "TimeInSeconds,MsBetweenPresents,MsInPresentAPI,MsUntilRenderComplete,"
-            "MsUntilDisplayed,MsBetweenDisplayChange\n"
-            "verolux-sim-run,10001,0x2711,Other,1,0,0,0.010000,0.000,2.000,4.000,20.000,0.000\n"
-            "verolux-sim-run,10001,0x2711,Other,1,0,1,0.026000,16.000,0.000,0.000,0.000,0.000\n",
-            presentMon.str());
 }
 
 }  // namespace
