@@ -10,6 +10,7 @@ namespace {
 constexpr nsecs_t US = 1'000;
 constexpr nsecs_t MS = 1'000'000;
 constexpr double NS_PER_MS = 1e6;
+constexpr nsecs_t FRAME_TIME_RESOLUTION = 10 * US;
 
 std::optional<double> ms(std::optional<nsecs_t> ns) {
     if (!ns) return std::nullopt;
@@ -35,11 +36,11 @@ Rates ratesOf(const Histogram& frameTimes) {
 // to 1 ms, 10 us bins to 100 ms.
 Measures::Measures(nsecs_t refreshPeriod)
     : mRefreshPeriod(refreshPeriod),
-      mGameFrameTimes(10 * US, 100 * MS),
-      mLatency(10 * US, 100 * MS),
-      mAnimationError(10 * US, 100 * MS),
-      mDisplayFrameTimes(10 * US, 100 * MS),
-      mContentAge(10 * US, 100 * MS),
+      mGameFrameTimes(FRAME_TIME_RESOLUTION, 100 * MS),
+      mLatency(FRAME_TIME_RESOLUTION, 100 * MS),
+      mAnimationError(FRAME_TIME_RESOLUTION, 100 * MS),
+      mDisplayFrameTimes(FRAME_TIME_RESOLUTION, 100 * MS),
+      mContentAge(FRAME_TIME_RESOLUTION, 100 * MS),
       mCpu(100, 1 * MS) {}
 
 void Measures::onFrame(const FrameRecord& frame) {
@@ -124,8 +125,11 @@ MeasuredLayer Measures::result() const {
 
     if (const auto median = mDisplayFrameTimes.percentile(50)) {
         m.medianGapMs = ms(median);
-        const auto threshold =
-                static_cast<nsecs_t>(std::llround(STUTTER_FACTOR * static_cast<double>(*median)));
+        // The median is known to the histogram's resolution; gaps within it of 1.5 x (three
+        // refreshes against two) are not stutters.
+        const nsecs_t threshold =
+                static_cast<nsecs_t>(std::llround(STUTTER_FACTOR * static_cast<double>(*median))) +
+                FRAME_TIME_RESOLUTION;
         auto gaps = mLongestGaps;
         // All gaps above the threshold were kept unless the shortest kept one is above it too.
         const bool allKept = gaps.size() < MAX_LISTED_STUTTERS || gaps.top().gap <= threshold;

@@ -200,7 +200,7 @@ def delay(folder, layers):
     axes[0].set_ylabel("display delay (ms)")
     axes[0].grid(alpha=0.3)
 
-    present = column(run.refreshes, "present_ns") / NS_PER_S
+    present = np.array([float(r["present_ns"]) for r in run.refreshes]) / NS_PER_S
     pictures = [r["picture"] for r in run.refreshes]
     if len(present):
         seconds = np.floor(present).astype(int)
@@ -209,9 +209,10 @@ def delay(folder, layers):
         covered = np.array([min(e + 1, present.max()) - max(e, present.min()) for e in edges])
         covered = np.maximum(covered, 1e-3)
         bottom = np.zeros(len(edges))
+        kinds = np.array(pictures)
         for kind, colour in PICTURE_COLOURS.items():
-            counts = np.array([sum(1 for s, p in zip(seconds, pictures) if s == e and p == kind)
-                               for e in edges], dtype=float) / covered
+            counts = np.bincount(seconds[kinds == kind] - edges[0], minlength=len(edges))
+            counts = counts[: len(edges)] / covered
             axes[1].bar(edges + 0.5, counts, width=0.9, bottom=bottom, color=colour, label=kind)
             bottom += counts
         axes[1].set_ylim(0, bottom.max() * 1.25)

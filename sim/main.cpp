@@ -82,7 +82,7 @@ std::string durationText(const Options& options, const std::optional<Capture>& c
 
 std::string buffersText(const LayerPlan& layer) {
     return std::to_string(layer.buffers.count) +
-           (layer.buffers.fixed ? " (fixed)" : " (sized for the display delay)");
+           (layer.buffers.fixed ? " (fixed)" : " (sized by the host)");
 }
 
 std::vector<std::pair<std::string, std::string>> describe(
