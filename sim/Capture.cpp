@@ -249,6 +249,12 @@ nsecs_t Capture::meanInterval() const {
     return span() / static_cast<nsecs_t>(frames.size() - 1);
 }
 
+double Capture::fpsOverFirst(size_t count) const {
+    if (count < 2 || count >= frames.size()) return fps();
+    const nsecs_t span = frames[count - 1].queueTime - frames.front().queueTime;
+    return span > 0 ? 1e9 * static_cast<double>(count - 1) / static_cast<double>(span) : fps();
+}
+
 Result<Capture> parseCapture(std::istream& in, const std::string& name, size_t maxFrames) {
     using R = Result<Capture>;
     CaptureParser parser(name, maxFrames);

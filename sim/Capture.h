@@ -48,6 +48,9 @@ struct Capture {
     nsecs_t meanInterval() const;
     // The rate the game ran at: 1 / the mean interval.
     double fps() const { return 1e9 / static_cast<double>(meanInterval()); }
+    // The rate over the first `count` frames, what a run that replayed only those asked of the
+    // game; the whole capture's beyond its end.
+    double fpsOverFirst(size_t count) const;
     nsecs_t span() const { return frames.empty() ? 0 : frames.back().queueTime; }
 };
 

@@ -208,10 +208,11 @@ int main(int argc, char** argv) {
                             BYTES_PER_PIXEL;
         facts.resolution =
                 std::to_string(options.gameWidth) + "x" + std::to_string(options.gameHeight);
-        facts.ownFps = capture ? capture->fps() : options.fps;
+        const MeasuredLayer measured = outputs.measures(i).result();
+        facts.ownFps = capture ? capture->fpsOverFirst(measured.framesQueued) : options.fps;
         facts.startTime = simulation.startTime();
         facts.captureEnded = result.captureEnded;
-        summaries.push_back({facts, outputs.measures(i).result()});
+        summaries.push_back({facts, measured});
     }
     const Summary* reference = summaries.size() > 1 ? &summaries[1] : nullptr;
     const std::string summary = formatSummary(summaries[0], reference);
@@ -238,7 +239,8 @@ int main(int argc, char** argv) {
               << (reference != nullptr ? " (reference-*.csv: mode 2)" : "") << "\n"
               << "  trace.json      open in https://ui.perfetto.dev\n"
               << "  *.png           the figures\n"
-              << "  engine.log      " << engineLog.lines() << " lines from the library (logLevel "
+              << "  engine.log      " << engineLog.lines()
+              << (engineLog.lines() == 1 ? " line" : " lines") << " from the library (logLevel "
               << verolux::sim::logLevelOf(settings.value) << "; --set logLevel=2 logs every step)\n"
               << "Peak memory of the simulator: " << usage.ru_maxrss / 1024 << " MiB." << std::endl;
     return status;

@@ -90,6 +90,9 @@ TEST(CaptureTest, theShippedCaptureIsValid) {
     ASSERT_EQ(300u, frames.size());
     EXPECT_GT(frames[61].queueTime - frames[60].queueTime, 80'000'000);  // a long frame: 83 ms
     EXPECT_EQ(-1, frames[100].renderDoneTime);
+    // The pace asked of a run that replayed the first 61 frames: 60 intervals of 33.3 ms.
+    EXPECT_NEAR(30.0, capture.value.fpsOverFirst(61), 0.2);
+    EXPECT_NEAR(1e9 / capture.value.meanInterval(), capture.value.fpsOverFirst(1000), 1e-9);
 }
 
 }  // namespace
