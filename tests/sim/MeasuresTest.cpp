@@ -5,6 +5,7 @@
 
 #include "sim/LayerRecorder.h"
 #include "sim/Measures.h"
+#include "support/Records.h"
 
 namespace verolux::sim {
 namespace {
@@ -13,15 +14,7 @@ constexpr nsecs_t MS = 1'000'000;
 constexpr nsecs_t HZ120 = 8'333'333;
 constexpr nsecs_t HZ60 = 16'666'667;
 
-RefreshRecord refresh(uint64_t index, nsecs_t period, Picture picture, double content) {
-    RefreshRecord r;
-    r.index = index;
-    r.vsyncTime = static_cast<nsecs_t>(index) * period;
-    r.presentTime = r.vsyncTime + period;
-    r.picture = picture;
-    r.contentTime = content;
-    return r;
-}
+using test::refreshAt;
 
 struct Scenario {
     const char* name;
@@ -57,7 +50,7 @@ TEST_P(MeasuresTest, animationErrorAndDisplayRateOfAHandMadeScreen) {
     Measures measures(s.period);
     for (uint64_t i = 0; i < 120; i++) {
         const auto [picture, content] = s.screen(i);
-        measures.onRefresh(refresh(i, s.period, picture, content));
+        measures.onRefresh(refreshAt(i, s.period, picture, content));
     }
     const MeasuredLayer m = measures.result();
     for (const auto& value : {m.errorP50Ms, m.errorP95Ms, m.errorP99Ms, m.errorMaxMs})
@@ -79,8 +72,8 @@ TEST(MeasuresHitchTest, oneHundredMillisecondHitchIsOneStutter) {
     for (uint64_t i = 0; i < 120; i++) {
         const bool held = i > 30 && i <= 35;
         if (!held && i > 0) frame++;
-        measures.onRefresh(refresh(i, HZ60, held ? Picture::REPEAT : Picture::NEW,
-                                   static_cast<double>(frame * HZ60)));
+        measures.onRefresh(refreshAt(i, HZ60, held ? Picture::REPEAT : Picture::NEW,
+                                     static_cast<double>(frame * HZ60)));
     }
     // Frames queued every 16.67 ms and shown 20 ms later; frame 3 never shown.
     for (uint64_t n = 1; n <= 10; n++) {
@@ -106,7 +99,7 @@ TEST(MeasuresHitchTest, oneHundredMillisecondHitchIsOneStutter) {
     // A display that fell behind skips vsyncs: refresh indices jump.
     Measures late(HZ60);
     for (uint64_t index : {0, 1, 4})
-        late.onRefresh(refresh(index, HZ60, Picture::NEW, 0));
+        late.onRefresh(refreshAt(index, HZ60, Picture::NEW, 0));
     EXPECT_EQ(2u, late.result().skippedVsyncs);
 }
 

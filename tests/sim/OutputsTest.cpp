@@ -11,6 +11,7 @@
 #include "sim/SpaceTimeWindow.h"
 #include "sim/Summary.h"
 #include "sim/TraceWriter.h"
+#include "support/Records.h"
 
 namespace verolux::sim {
 namespace {
@@ -18,15 +19,7 @@ namespace {
 constexpr nsecs_t MS = 1'000'000;
 constexpr nsecs_t HZ120 = 8'333'333;
 
-RefreshRecord refresh(uint64_t index, nsecs_t period, Picture picture, double content) {
-    RefreshRecord r;
-    r.index = index;
-    r.vsyncTime = static_cast<nsecs_t>(index) * period;
-    r.presentTime = r.vsyncTime + period;
-    r.picture = picture;
-    r.contentTime = content;
-    return r;
-}
+using test::refreshAt;
 
 TEST(CsvTest, framesRefreshesAndPresentMonRowsHaveTheirColumns) {
     FrameRecord f;
@@ -48,7 +41,7 @@ TEST(CsvTest, framesRefreshesAndPresentMonRowsHaveTheirColumns) {
     PresentMonCsv monitor(presentMon, 1000, "verolux-sim-run", 10001);
     monitor.onFrame(f);
     monitor.onFrame(dropped);
-    RefreshRecord r = refresh(3, HZ120, Picture::BLEND, 1000 + 20 * MS);
+    RefreshRecord r = refreshAt(3, HZ120, Picture::BLEND, 1000 + 20 * MS);
     r.items[r.itemCount++] = {7, 1.0f, 0.75f};
     r.items[r.itemCount++] = {8, 0.25f, 0.25f};
     r.delay = 64 * MS;
@@ -81,7 +74,7 @@ TEST(TraceTest, streamsAValidTraceWithPictureSlicesCountersAndOptions) {
     {
         TraceWriter trace(out, 0, options);
         RecordSink& layer = trace.addLayer(1, "run: mode 0 retime", HZ120);
-        RefreshRecord r = refresh(0, HZ120, Picture::BLEND, 1 * MS);
+        RefreshRecord r = refreshAt(0, HZ120, Picture::BLEND, 1 * MS);
         r.items[r.itemCount++] = {3, 1.0f, 0.5f};
         r.items[r.itemCount++] = {4, 0.5f, 0.5f};
         layer.onRefresh(r);
@@ -117,7 +110,7 @@ TEST(SpaceTimeWindowTest, keepsTheWindowOrTheLastStretchOfAShorterRun) {
     const std::string path = testing::TempDir() + "verolux-" + std::to_string(getpid()) + ".png";
     auto rowsOf = [&](SpaceTimeWindow& window) {
         for (uint64_t i = 0; i < 10; i++) {
-            RefreshRecord r = refresh(i, 10, Picture::NEW, 0);
+            RefreshRecord r = refreshAt(i, 10, Picture::NEW, 0);
             r.scanline = {static_cast<uint8_t>(i), 0, 0, 9, 9, 9};
             window.onRefresh(r);
         }
