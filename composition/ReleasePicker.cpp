@@ -1,8 +1,10 @@
 #include "ReleasePicker.h"
 
+#include <algorithm>
 #include <chrono>
 #include <thread>
 
+#include "../timing/Saturating.h"
 #include "FillInReleasePicker.h"
 #include "JustInTimeReleasePicker.h"
 #include "Log.h"
@@ -132,13 +134,34 @@ void ReleasePicker::wakeSelection() {
     mCondition.notify_all();
 }
 
-ReleaseChoice ReleasePicker::decideLocked(uint32_t& eventsSeen) {
+ReleaseChoice ReleasePicker::stepLocked(bool blocking, uint32_t& eventsSeen) {
     mDeciding.store(true);
     eventsSeen = mEventCount.load();
     applyInboxLocked();
-    ReleaseChoice choice = tryRelease();
+    ReleaseChoice choice = blocking ? tryRelease() : decideLocked();
     mDeciding.store(false);
+    if (choice.action == ReleaseChoice::WAIT_FOR_TIME) boundWaitLocked(choice);
     return choice;
+}
+
+void ReleasePicker::boundWaitLocked(ReleaseChoice& choice) {
+    // Every bound is at least MAX_WAIT_PAST_COMPOSITION: a shorter wait needs no clock read.
+    if (choice.waitTime <= MAX_WAIT_PAST_COMPOSITION) return;
+    const nsecs_t untilComposition =
+            saturatingSub(mUpcomingCompositionTime, systemTime(SYSTEM_TIME_MONOTONIC));
+    const nsecs_t bound =
+            saturatingAdd(std::max<nsecs_t>(untilComposition, 0), MAX_WAIT_PAST_COMPOSITION);
+    if (choice.waitTime <= bound) return;
+    ILOG(1, "Interpolation::ReleasePicker [%s] wait of %ld ns bounded to %ld ns", mName.c_str(),
+         choice.waitTime, bound);
+    choice.waitTime = bound;
+}
+
+ReleaseChoice ReleasePicker::decideRelease() {
+    std::lock_guard lock(mMutex);
+    if (!mContinue) return {ReleaseChoice::RELEASE, FrameItem(), 0};
+    uint32_t eventsSeen;
+    return stepLocked(/*blocking=*/false, eventsSeen);
 }
 
 FrameItem ReleasePicker::selectFrameForRelease() {
@@ -155,7 +178,7 @@ FrameItem ReleasePicker::selectFrameForRelease() {
         if (!mContinue) break;
 
         uint32_t eventsSeen;
-        choice = decideLocked(eventsSeen);
+        choice = stepLocked(/*blocking=*/true, eventsSeen);
         const bool eventArrived = mEventCount.load() != eventsSeen;
 
         if (choice.action == ReleaseChoice::WAIT_FOR_TIME) {

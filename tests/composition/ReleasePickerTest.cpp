@@ -1,11 +1,15 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <chrono>
 #include <functional>
 #include <future>
 #include <limits>
+#include <set>
+#include <string>
 #include <thread>
+#include <vector>
 
 #include "FillInReleasePicker.h"
 #include "JustInTimeReleasePicker.h"
@@ -52,6 +56,32 @@ protected:
 
     void broadcast(EventType type, const EventData& data) {
         EventDispatcher::broadcastEvent(mUid, type, systemTime(SYSTEM_TIME_MONOTONIC), data);
+    }
+
+    static int policySteps(const LogCapture& log) {
+        const std::vector<std::string> texts = log.texts();
+        return static_cast<int>(std::count_if(texts.begin(), texts.end(), [](const auto& text) {
+            return text.find("tryRelease: size") != std::string::npos;
+        }));
+    }
+
+    // A selection on another thread, once its first policy step is made: a step holds the picker's
+    // mutex, so whatever takes the mutex afterwards comes after the selection has begun to wait.
+    static std::future<FrameItem> selectAfterOneStep(sp<ReleasePicker> picker,
+                                                     const LogCapture& log) {
+        auto selection = std::async(std::launch::async,
+                                    [picker] { return picker->selectFrameForRelease(); });
+        while (policySteps(log) == 0)
+            std::this_thread::yield();
+        return selection;
+    }
+
+    static void setMargin(const sp<ReleasePicker>& picker, int32_t marginMs) {
+        if (auto* justInTime = dynamic_cast<JustInTimeReleasePicker*>(picker.get())) {
+            Settings settings;
+            settings.justInTimeMarginMs = static_cast<uint32_t>(marginMs);
+            justInTime->onSettingsChanged(settings);
+        }
     }
 
     const uint32_t mUid = test::nextTestUid();
@@ -130,6 +160,74 @@ TEST_F(ReleasePickerTest, logsEachPolicyStepAndEveryEventIssue) {
                             "Interpolation::NoInterpReleasePicker: [game#0] tryRelease: size 1 "
                             "upcomingDisplayTime 0 mLatestFrameDisplayedTime 5 "
                             "mUpcomingCompositionTime 500"));
+}
+
+// What decideRelease() decides without blocking, the selection carries out: a release at once, a
+// wait for the next event (which here runs out), a wait of the given time or a sleep before the
+// oldest frame goes.
+TEST_F(ReleasePickerTest, selectionCarriesOutWhatTheNonBlockingStepDecides) {
+    test::addSteadyFrames(*mTimings, 1, 30, 1 * MS, 2 * MS);  // the latency picker predicts 16 ms
+    const std::function<void()> events[] = {
+            [&] {
+                queue({10, 20, 30});
+            },
+            [&] {
+                broadcast(eCompositionEstimateEvent, systemTime(SYSTEM_TIME_MONOTONIC) + 20 * MS);
+                broadcast(eBufferComposedEvent, stateOf({20}));
+            },
+            [&] {
+                queue({-20, -10, 40});
+                broadcast(eBufferComposedEvent, stateOf({40}));
+            }};
+    std::set<int32_t> actions;
+    for (uint32_t mode = 0; mode <= eLatencyReductionMode; mode++) {
+        mList->clearEveryFrame();
+        sp<ReleasePicker> stepper = picker(mode), selector = picker(mode);
+        setMargin(stepper, 4);
+        setMargin(selector, 4);
+        for (const auto& sendEvents : events) {
+            sendEvents();
+            const auto start = steady_clock::now();
+            const ReleaseChoice choice = stepper->decideRelease();
+            const FrameItem selected = selector->selectFrameForRelease();
+            const auto took = steady_clock::now() - start;
+            SCOPED_TRACE(testing::Message() << "mode " << mode << " action " << choice.action);
+            actions.insert(choice.action);
+            if (choice.action == ReleaseChoice::RELEASE) {
+                EXPECT_EQ(choice.frame.mID, selected.mID);
+            } else if (choice.action == ReleaseChoice::WAIT_FOR_EVENT) {
+                EXPECT_TRUE(selected.isEmpty());
+                EXPECT_GE(took, std::chrono::nanoseconds(ReleasePicker::EVENT_WAIT_TIMEOUT));
+            } else {  // a time to wait or to sleep, then the oldest frame
+                EXPECT_EQ(stepper->chooseOldestFrame().frame.mID, selected.mID);
+                EXPECT_GE(took, std::chrono::nanoseconds(choice.waitTime) - 1us);
+            }
+        }
+    }
+    EXPECT_EQ(4u, actions.size());
+}
+
+TEST_F(ReleasePickerTest, stopEndsASelectionInAnyWaitWhateverTheMargin) {
+    test::addSteadyFrames(*mTimings, 1, 30, 1 * MS, 2 * MS);
+    queue({10, 20, 30});
+    for (uint32_t mode = 0; mode <= eLatencyReductionMode; mode++) {
+        // The latency picker sleeps 16 ms with the newest frame on screen; the just-in-time one
+        // waits past the composition for as long as its margin says; the others wait for an event.
+        sp<ReleasePicker> waiting = picker(mode);
+        setMargin(waiting, std::numeric_limits<int32_t>::min());
+        broadcast(eBufferComposedEvent,
+                  mode == eLatencyReductionMode ? stateOf({30}) : RenderState{});
+        broadcast(eCompositionEstimateEvent, systemTime(SYSTEM_TIME_MONOTONIC) + 10'000 * MS);
+        LogCapture log(2);
+        auto selection = selectAfterOneStep(waiting, log);
+        waiting->stop();
+        // The sleep runs out and its release stands; every wait ends at once with nothing.
+        ASSERT_EQ(std::future_status::ready, selection.wait_for(1s)) << mode;
+        EXPECT_EQ(mode == eLatencyReductionMode ? 10 : 0, selection.get().mID) << mode;
+        EXPECT_FALSE(log.contains("Interpolation::ReleasePicker timed out. mContinue = 0"));
+        EXPECT_TRUE(waiting->selectFrameForRelease().isEmpty());
+        EXPECT_TRUE(waiting->decideRelease().frame.isEmpty());
+    }
 }
 
 // A policy scripted by the test, to drive the waits of the selection.
@@ -241,11 +339,7 @@ TEST_F(ReleasePickerWaitTest, tearDownReleasesAWaiterWithTheEmptyFrame) {
 
 class JustInTimeReleasePickerTest : public ReleasePickerTest {
 protected:
-    void setMargin(int32_t marginMs) {
-        Settings settings;
-        settings.justInTimeMarginMs = static_cast<uint32_t>(marginMs);
-        mPicker->onSettingsChanged(settings);
-    }
+    void setMargin(int32_t marginMs) { ReleasePickerTest::setMargin(mPicker, marginMs); }
 
     void composeAt(nsecs_t compositionTime, std::initializer_list<nsecs_t> shown) {
         mPicker->onEvent(eBufferComposedEvent, 0, stateOf(shown));
@@ -290,6 +384,15 @@ TEST_F(JustInTimeReleasePickerTest, otherwiseWaitsUntilTheMarginBeforeTheComposi
     const ReleaseChoice late = mPicker->attempEarlyRelease();
     EXPECT_EQ(ReleaseChoice::WAIT_FOR_TIME, late.action);
     EXPECT_EQ(1 * MS, late.waitTime);
+
+    // 25 days after the composition, as the policy asks, bounded to 50 ms after it.
+    setMargin(std::numeric_limits<int32_t>::min());
+    composeAt(clock.now() + 10 * MS, {20});
+    EXPECT_EQ(2'147'483'658 * MS, mPicker->attempEarlyRelease().waitTime);
+    LogCapture log(1);
+    EXPECT_EQ(60 * MS, mPicker->decideRelease().waitTime);
+    EXPECT_THAT(log.texts(), ElementsAre("Interpolation::ReleasePicker [game#0] wait of "
+                                         "2147483658000000 ns bounded to 60000000 ns"));
 }
 
 TEST_F(JustInTimeReleasePickerTest, selectionWakesAtTheMarginBeforeTheComposition) {
