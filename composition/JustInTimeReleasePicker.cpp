@@ -7,7 +7,7 @@ namespace android::Interpolation {
 
 JustInTimeReleasePicker::JustInTimeReleasePicker(sp<FrameList>& frameList, String8& name,
                                                  const uint32_t& uid)
-    : ReleasePicker(frameList, name, uid) {}
+    : ReleasePicker(frameList, name, uid, EVENT_FLAGS) {}
 
 void JustInTimeReleasePicker::onFirstRef() {
     ILOG(2, "Interpolation::JustInTimeReleasePicker [%s] onFirstRef", mName.c_str());

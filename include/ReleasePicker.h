@@ -71,6 +71,9 @@ public:
     ReleaseChoice decideRelease();
     // Release the oldest queued frame now (the empty frame when there is none).
     ReleaseChoice chooseOldestFrame();
+    // The events after which the policy's decision can be different; the others are recorded but
+    // never wake a waiting selection.
+    uint32_t decisionEvents() const { return mDecisionEvents; }
     // Ends every selection for good: a selection waiting for an event or a time returns the empty
     // frame at once, later ones return it without deciding. Returns once no thread is inside
     // selectFrameForRelease(), which takes at most the rest of a policy step (the latency picker's
@@ -79,7 +82,9 @@ public:
     void stop();
 
 protected:
-    ReleasePicker(sp<FrameList>& frameList, String8& name, const uint32_t& uid);
+    // `decisionEvents` are the events the mode's policy reads (see decisionEvents()).
+    ReleasePicker(sp<FrameList>& frameList, String8& name, const uint32_t& uid,
+                  uint32_t decisionEvents = EVENT_FLAGS);
 
     // The policy step without blocking: the same as tryRelease() unless the policy blocks, which it
     // then expresses as a choice (RELEASE_AFTER_SLEEP). Runs with mMutex held.
@@ -111,7 +116,7 @@ private:
     };
 
     void applyInboxLocked();
-    void wakeSelection();
+    void wakeSelection(bool decisionEvent);
     // One step: the inbox, then the policy in its blocking (tryRelease) or non-blocking
     // (decideLocked) form, then the bound on a computed wait.
     ReleaseChoice stepLocked(bool blocking, uint32_t& eventsSeen);
@@ -129,6 +134,7 @@ private:
     std::atomic<bool> mDeciding{false};  // a policy step is running
     int mActiveSelections = 0;           // guarded by mMutex
     std::condition_variable mSelectionsDone;
+    const uint32_t mDecisionEvents;
 };
 
 }  // namespace android::Interpolation

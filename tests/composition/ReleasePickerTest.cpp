@@ -230,6 +230,21 @@ TEST_F(ReleasePickerTest, stopEndsASelectionInAnyWaitWhateverTheMargin) {
     }
 }
 
+TEST_F(ReleasePickerTest, eventsThePolicyDoesNotReadNeverWakeTheSelection) {
+    queue({10});
+    for (uint32_t mode : {eRetimeMode, eFillInMode, eNoInterpMode, eUnlimitedMode}) {
+        sp<ReleasePicker> waiting = picker(mode);
+        LogCapture log(2);
+        auto selection = selectAfterOneStep(waiting, log);
+        // What is on screen matters only to the displayed policies, when to none of these.
+        if (mode == eRetimeMode || mode == eFillInMode)
+            broadcast(eBufferComposedEvent, stateOf({5}));
+        broadcast(eCompositionEstimateEvent, nsecs_t{1});
+        EXPECT_TRUE(selection.get().isEmpty());
+        EXPECT_EQ(1, policySteps(log)) << mode;
+    }
+}
+
 // A policy scripted by the test, to drive the waits of the selection.
 class ScriptedPicker : public ReleasePicker {
 public:
