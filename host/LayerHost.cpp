@@ -1,5 +1,7 @@
 #include "LayerHost.h"
 
+#include <pthread.h>
+#include <sys/prctl.h>
 #include <ui/FenceTime.h>
 
 #include <algorithm>
@@ -51,7 +53,8 @@ LayerHost::LayerHost(Config config, FrameReleasedCallback onFrameReleased)
     mPicker = ReleasePicker::newPickerFromMode(frameList, timings, name, mConfig.uid, mConfig.mode);
     mPicker->setFrameListCapacity(mConfig.frameListCapacity);
     mReleaseListener = new ReleaseListener(this);
-    EventDispatcher::subscribe(mConfig.uid, LISTENED_EVENTS, mReleaseListener);
+    mListenedEvents = eFrameReleasedEvent | mPicker->decisionEvents();
+    EventDispatcher::subscribe(mConfig.uid, mListenedEvents, mReleaseListener);
     mReleasedSlots.reserve(64);
     mReleasedScratch.reserve(64);
     mQueuedFrames.reserve(64);
@@ -59,7 +62,7 @@ LayerHost::LayerHost(Config config, FrameReleasedCallback onFrameReleased)
 
 LayerHost::~LayerHost() {
     stop();
-    EventDispatcher::unsubscribe(mConfig.uid, LISTENED_EVENTS, mReleaseListener);
+    EventDispatcher::unsubscribe(mConfig.uid, mListenedEvents, mReleaseListener);
 }
 
 void LayerHost::start() {
@@ -70,13 +73,15 @@ void LayerHost::start() {
 void LayerHost::stop() {
     mRunning = false;
     noteQueueChange();
-    // Removals waiting on a frame lock give up; the release thread holds the picker while it
-    // selects, and drops it (stopping it) after at most one event wait.
+    // Removals waiting on a frame lock give up. The release thread holds its own reference to the
+    // picker, so dropping ours would not stop it: stopping it ends the selection's wait at once.
     mFrameList->killLocks();
-    mPicker.clear();
+    if (mPicker != nullptr) mPicker->stop();
     if (mReleaseThread.joinable()) mReleaseThread.join();
+    mPicker.clear();
     mFrameList->clearEveryFrame();
     recordReleases();
+    mRetiredFences.drop();
 }
 
 void LayerHost::noteQueueChange() {
@@ -95,6 +100,7 @@ void LayerHost::noteFrameLeft(uint64_t frameNumber, int slot) {
 }
 
 void LayerHost::releaseLoop(sp<ReleasePicker> picker) {
+    configureReleaseThread();
     while (mRunning) {
         const uint64_t changesBefore = [this] {
             std::lock_guard lock(mChangeMutex);
@@ -102,19 +108,26 @@ void LayerHost::releaseLoop(sp<ReleasePicker> picker) {
         }();
         const FrameItem frame = picker->selectFrameForRelease();
         recordReleases();
-        if (frame.mIndex != std::numeric_limits<uint64_t>::max()) {
-            // The removal only waits for the composition in progress, which gives its frames back
-            // before the compositor acquires again.
-            std::lock_guard acquiring(mAcquireMutex);
+        if (frame.mIndex != NO_FRAME) {
+            setLeavingFrame(frame.mIndex);
             mFrameList->clearFrameAtLocking(frame.mID);
+            setLeavingFrame(NO_FRAME);
+            // At once, while this thread still holds the frame: the timings let go of its fence
+            // here, not on the composition thread.
+            recordReleases();
             continue;
         }
         // Nothing to release. Some policies say so at once (an empty queue), so ask again only
-        // once the queue or the screen has changed, or after the picker's own event wait.
+        // after an event the picker decides on, or after the picker's own event wait.
         std::unique_lock lock(mChangeMutex);
         mQueueChanged.wait_for(lock, std::chrono::nanoseconds(ReleasePicker::EVENT_WAIT_TIMEOUT),
                                [&] { return mQueueChanges != changesBefore || !mRunning; });
     }
+}
+
+void LayerHost::setLeavingFrame(uint64_t frameNumber) {
+    std::lock_guard acquiring(mAcquireMutex);
+    mLeavingFrame = frameNumber;
 }
 
 void LayerHost::recordReleases() {
@@ -148,12 +161,14 @@ void LayerHost::onBufferQueued(uint64_t frameNumber, int slot,
     const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
     mRealFps->setReferenceTime(now);
     mRealFps->logBufferProvided(now);
+    mRetiredFences.drop();
 }
 
 void LayerHost::onBufferAcquired(uint64_t frameNumber, int slot,
                                  const sp<android::GraphicBuffer>& buffer, nsecs_t timestamp,
                                  const sp<android::Fence>& acquireFence) {
     std::lock_guard acquiring(mAcquireMutex);
+    if (frameNumber == mLeavingFrame) return;
     {
         std::lock_guard lock(mReleasedMutex);
         if (std::find(mQueuedFrames.begin(), mQueuedFrames.end(), frameNumber) ==
@@ -177,6 +192,7 @@ RenderState LayerHost::compose(nsecs_t displayTime) {
 
 void LayerHost::onCompositionDone(const RenderState& state, nsecs_t displayTime,
                                   const std::shared_ptr<android::FenceTime>& presentFence) {
+    mRetiredFences.retire(state);
     for (const RenderItem& item : state.items) {
         if (item.frame.isEmpty()) continue;
         mTimings->presentFenceTimings(presentFence, item.frame.mTextureSlot);
@@ -187,10 +203,19 @@ void LayerHost::onCompositionDone(const RenderState& state, nsecs_t displayTime,
         // from here on can use are removed here: the oldest, once two frames are at or before now.
         for (size_t n = mFrameList->size(); n > 0 && mFrameList->isOldestFrameUnused(displayTime);
              n--) {
-            mFrameList->clearOldestFrameIfUnusedLocking(displayTime);
+            std::vector<FrameItem> removed =
+                    mFrameList->clearOldestFrameIfUnusedLocking(displayTime);
+            mRetiredFences.retire(removed);
         }
     }
     recordReleases();
+}
+
+void configureReleaseThread() {
+    pthread_setname_np(pthread_self(), "verolux-release");
+    // A release just in time must not be deferred to merge with other timers: the kernel's
+    // default slack (50 us) is most of the lateness of a timed wait.
+    prctl(PR_SET_TIMERSLACK, 1UL, 0UL, 0UL, 0UL);
 }
 
 bool deliverSettings(uint32_t uid, const std::vector<SettingValue>& values) {

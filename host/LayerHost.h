@@ -8,6 +8,7 @@
 #include <atomic>
 #include <condition_variable>
 #include <functional>
+#include <limits>
 #include <memory>
 #include <mutex>
 #include <thread>
@@ -21,6 +22,7 @@
 #include "RealFPSTracker.h"
 #include "ReleasePicker.h"
 #include "RenderStateBuilder.h"
+#include "host/RetiredFences.h"
 #include "host/SettingsMessage.h"
 
 namespace verolux::host {
@@ -49,8 +51,9 @@ public:
 
     // Starts the release thread.
     void start();
-    // Tear-down, in the order that never blocks: no more waiting on frame locks, the release thread
-    // ends, the frames still queued are handed back. Refreshes and buffers must have stopped.
+    // Tear-down, in the order that never blocks: no more waiting on frame locks, the picker stops,
+    // which ends the release thread's wait whatever it waits for, the release thread ends, the
+    // frames still queued are handed back. Refreshes and buffers must have stopped.
     void stop();
 
     // The buffer queue's side. An acquisition that comes after the engine has already let the frame
@@ -76,15 +79,12 @@ public:
 private:
     class ReleaseListener;
 
-    // Frames leaving the list are handed back; frame arrivals and compositions wake the release
-    // thread when its picker had nothing to release.
-    static constexpr uint32_t LISTENED_EVENTS = android::Interpolation::eFrameReleasedEvent |
-                                                android::Interpolation::eFrameReceivedEvent |
-                                                android::Interpolation::eBufferComposedEvent;
+    static constexpr uint64_t NO_FRAME = std::numeric_limits<uint64_t>::max();
 
     void noteQueueChange();
     void noteFrameLeft(uint64_t frameNumber, int slot);
     void releaseLoop(android::sp<android::Interpolation::ReleasePicker> picker);
+    void setLeavingFrame(uint64_t frameNumber);
     void recordReleases();
 
     const Config mConfig;
@@ -98,6 +98,9 @@ private:
             mDeadlinePredictor;
     const FrameReleasedCallback mOnFrameReleased;
     android::sp<ReleaseListener> mReleaseListener;
+    // Frames leaving the list, to hand them back, and the events after which the picker may
+    // decide otherwise, to ask it again when it had nothing to release.
+    uint32_t mListenedEvents = 0;
 
     std::atomic<bool> mRunning{false};
     std::thread mReleaseThread;
@@ -106,9 +109,13 @@ private:
     std::condition_variable mQueueChanged;
     uint64_t mQueueChanges = 0;  // guarded by mChangeMutex
 
-    // Held across the acquisition of a frame and across the release thread's removals, so that
-    // a frame is never acquired into the queue after it left it. Taken before the list's mutex.
+    // Held across the acquisition of a frame, so that a frame is never acquired into the queue
+    // after it left it: a frame that has left is no longer among mQueuedFrames, and the one the
+    // release thread is taking out is mLeavingFrame. The removal itself waits on frame locks, which
+    // a composition may hold for as long as it likes, so it never holds this mutex: the
+    // composition thread acquires. Taken before the list's mutex.
     std::mutex mAcquireMutex;
+    uint64_t mLeavingFrame = NO_FRAME;  // guarded by mAcquireMutex
 
     // Frames that left the list, whose release the frame timings have not recorded yet: the
     // listener cannot record them itself, since that broadcasts from inside a broadcast.
@@ -118,7 +125,15 @@ private:
     std::vector<uint64_t> mQueuedFrames;  // guarded by mReleasedMutex
     std::mutex mRecordingMutex;
     std::vector<int> mReleasedScratch;  // guarded by mRecordingMutex
+
+    // The fences of frames composed or removed on the composition thread; the buffer queue's
+    // thread drops them.
+    RetiredFences mRetiredFences;
 };
+
+// Sets up the calling thread as the host sets up its release thread: named, and with the least
+// timer slack, so that a timed release wakes when it is due.
+void configureReleaseThread();
 
 // Delivers settings as the controlling service does: an updateSettings parcel for the uid, then
 // notifyChanges. Returns updateSettings' result.
