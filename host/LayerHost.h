@@ -21,6 +21,10 @@
 #include "RealFPSTracker.h"
 #include "ReleasePicker.h"
 #include "RenderStateBuilder.h"
+#include "host/LayerMonitor.h"
+#include "host/LayerRates.h"
+#include "host/LayerSettings.h"
+#include "host/RefreshClassifier.h"
 #include "host/SettingsMessage.h"
 
 namespace verolux::host {
@@ -29,8 +33,23 @@ namespace verolux::host {
 // for its mode, hands them every buffer the game queues and acquires, asks for a state at every
 // refresh and gives the frames back after composing, and runs the release thread. Frames that leave
 // the frame list, by whichever path, are handed back through the FrameReleasedCallback.
+//
+// Around that it runs the layer's rates (LayerRates), statistics and watchdogs (LayerMonitor). A
+// layer whose settings do not interpolate it (gameFpsLimit below 1, as after a watchdog switched
+// the game off) is composed as the platform composes any layer: the host latches the newest
+// acquired frame itself, shows it whole, and lets every older frame go.
 class LayerHost {
 public:
+    enum class CompositionType { DEVICE, CLIENT };
+
+    // What the host reports of the layer besides its pictures.
+    struct Status {
+        int32_t refreshRate = 0;            // the detected refresh rate, Hz
+        int32_t gameRateLimit = 0;          // the game-rate agent's limit, 0 before the first
+        bool gameRateLimitApplied = false;  // the game is held to it (gfpsOffsetEnabled)
+        bool interpolating = false;         // the settings interpolate the layer
+    };
+
     struct Config {
         android::String8 name;
         uint32_t uid = 0;
@@ -64,11 +83,22 @@ public:
                           const android::sp<android::GraphicBuffer>& buffer, nsecs_t timestamp,
                           const android::sp<android::Fence>& acquireFence);
 
-    // The display's side: the state to compose for `displayTime`; its frames stay locked until
-    // onCompositionDone.
-    android::Interpolation::RenderState compose(nsecs_t displayTime);
+    // The display's side, on one thread, at every refresh: onVsync, which says whether the layer
+    // presents at this refresh; when it does, compose, the state for `displayTime`, whose frames
+    // stay locked until onCompositionDone; then onCompositionDone always, with the composed state
+    // (an empty one when the layer did not present: it keeps its previous picture).
+    bool onVsync(nsecs_t vsync);
+    const android::Interpolation::RenderState& compose(nsecs_t displayTime);
     void onCompositionDone(const android::Interpolation::RenderState& state, nsecs_t displayTime,
-                           const std::shared_ptr<android::FenceTime>& presentFence);
+                           const std::shared_ptr<android::FenceTime>& presentFence,
+                           CompositionType type = CompositionType::DEVICE);
+
+    Status status() const;
+    // The frame-event counts of the second before `now`.
+    FrameRateStatistics statistics(nsecs_t now) const;
+    // The layer in the platform's dumpsys style: the frame list, the delay, the statistics line,
+    // the version block and the settings line.
+    void dump(android::String8& out) const;
 
     const Config& config() const { return mConfig; }
     const android::sp<android::FrameList>& frameList() const { return mFrameList; }
@@ -86,6 +116,9 @@ private:
     void noteFrameLeft(uint64_t frameNumber, int slot);
     void releaseLoop(android::sp<android::Interpolation::ReleasePicker> picker);
     void recordReleases();
+    void latchNewestFrame();
+    // Lets go the frames that no later refresh will show.
+    void clearUnusedFrames(nsecs_t displayTime);
 
     const Config mConfig;
     const android::sp<android::FrameList> mFrameList;
@@ -98,6 +131,15 @@ private:
             mDeadlinePredictor;
     const FrameReleasedCallback mOnFrameReleased;
     android::sp<ReleaseListener> mReleaseListener;
+    const android::sp<LayerSettings> mSettings;
+    LayerRates mRates;
+    LayerMonitor mMonitor;
+
+    // The composition thread's own.
+    android::Interpolation::RenderState mState;  // reused, so that latching allocates nothing
+    bool mPresenting = true;
+    bool mLatchedByHost = false;
+    RefreshClassifier mClassifier;
 
     std::atomic<bool> mRunning{false};
     std::thread mReleaseThread;
