@@ -194,6 +194,11 @@ int main(int argc, char** argv) {
         }
     };
     check(outputs.finish());
+    {
+        std::ofstream file(out / "dumpsys.txt");
+        file << result.dump;
+        if (!file) check(Status{errorLine("cannot write " + (out / "dumpsys.txt").string())});
+    }
 
     std::vector<Summary> summaries;
     for (size_t i = 0; i < simulation.layers().size(); i++) {
@@ -210,6 +215,7 @@ int main(int argc, char** argv) {
                 std::to_string(options.gameWidth) + "x" + std::to_string(options.gameHeight);
         const MeasuredLayer measured = outputs.measures(i).result();
         facts.ownFps = capture ? capture->fpsOverFirst(measured.framesQueued) : options.fps;
+        facts.refreshHz = options.hz;
         facts.startTime = simulation.startTime();
         facts.captureEnded = result.captureEnded;
         summaries.push_back({facts, measured});
@@ -238,6 +244,7 @@ int main(int argc, char** argv) {
               << "  presentmon.csv  the frames in PresentMon's columns"
               << (reference != nullptr ? " (reference-*.csv: mode 2)" : "") << "\n"
               << "  trace.json      open in https://ui.perfetto.dev\n"
+              << "  dumpsys.txt     each layer's dump at the end of the run\n"
               << "  *.png           the figures\n"
               << "  engine.log      " << engineLog.lines()
               << (engineLog.lines() == 1 ? " line" : " lines") << " from the library (logLevel "
