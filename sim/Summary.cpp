@@ -280,9 +280,9 @@ void warnings(const Summary& s, std::vector<std::string>& out) {
     }
     if (m.gameRateLimitApplied && m.lastGameRateLimit && m.lastStatistics) {
         out.push_back(
-                format("Note: %s: the game was held to the game-rate limit (gfpsOffsetEnabled): "
-                       "its limit ended at %d fps and it queued %d frames in the last "
-                       "second, against its own %.1f fps.",
+                format("Note: %s: the game was held to the game-rate limit (gfpsOffsetEnabled), "
+                       "which ended at %d fps; the game queued %d frames in the last second, "
+                       "against its own %.1f fps.",
                        s.facts.role.c_str(), *m.lastGameRateLimit, m.lastStatistics->gameFps,
                        s.facts.ownFps.value_or(0)));
     }
