@@ -2,6 +2,7 @@
 
 #include <ui/FenceTime.h>
 
+#include <algorithm>
 #include <chrono>
 #include <limits>
 #include <memory>
@@ -28,8 +29,7 @@ public:
         const auto* frame = std::get_if<FrameItem>(&data);
         if (frame == nullptr) return;
         mHost->mOnFrameReleased(*frame);
-        std::lock_guard lock(mHost->mReleasedMutex);
-        mHost->mReleasedSlots.push_back(frame->mTextureSlot);
+        mHost->noteFrameLeft(frame->mIndex, frame->mTextureSlot);
     }
 
 private:
@@ -54,6 +54,7 @@ LayerHost::LayerHost(Config config, FrameReleasedCallback onFrameReleased)
     EventDispatcher::subscribe(mConfig.uid, LISTENED_EVENTS, mReleaseListener);
     mReleasedSlots.reserve(64);
     mReleasedScratch.reserve(64);
+    mQueuedFrames.reserve(64);
 }
 
 LayerHost::~LayerHost() {
@@ -86,6 +87,13 @@ void LayerHost::noteQueueChange() {
     mQueueChanged.notify_all();
 }
 
+void LayerHost::noteFrameLeft(uint64_t frameNumber, int slot) {
+    std::lock_guard lock(mReleasedMutex);
+    mReleasedSlots.push_back(slot);
+    const auto queued = std::find(mQueuedFrames.begin(), mQueuedFrames.end(), frameNumber);
+    if (queued != mQueuedFrames.end()) mQueuedFrames.erase(queued);
+}
+
 void LayerHost::releaseLoop(sp<ReleasePicker> picker) {
     while (mRunning) {
         const uint64_t changesBefore = [this] {
@@ -95,6 +103,9 @@ void LayerHost::releaseLoop(sp<ReleasePicker> picker) {
         const FrameItem frame = picker->selectFrameForRelease();
         recordReleases();
         if (frame.mIndex != std::numeric_limits<uint64_t>::max()) {
+            // The removal only waits for the composition in progress, which gives its frames back
+            // before the compositor acquires again.
+            std::lock_guard acquiring(mAcquireMutex);
             mFrameList->clearFrameAtLocking(frame.mID);
             continue;
         }
@@ -129,6 +140,10 @@ void LayerHost::onBufferDequeued(int slot, nsecs_t requestTime, nsecs_t dequeueT
 void LayerHost::onBufferQueued(uint64_t frameNumber, int slot,
                                const sp<android::GraphicBuffer>& buffer, nsecs_t timestamp,
                                const sp<android::Fence>& acquireFence) {
+    {
+        std::lock_guard lock(mReleasedMutex);
+        mQueuedFrames.push_back(frameNumber);
+    }
     mInterceptor->interceptFrame(frameNumber, slot, buffer, timestamp, acquireFence, false);
     const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
     mRealFps->setReferenceTime(now);
@@ -138,6 +153,14 @@ void LayerHost::onBufferQueued(uint64_t frameNumber, int slot,
 void LayerHost::onBufferAcquired(uint64_t frameNumber, int slot,
                                  const sp<android::GraphicBuffer>& buffer, nsecs_t timestamp,
                                  const sp<android::Fence>& acquireFence) {
+    std::lock_guard acquiring(mAcquireMutex);
+    {
+        std::lock_guard lock(mReleasedMutex);
+        if (std::find(mQueuedFrames.begin(), mQueuedFrames.end(), frameNumber) ==
+            mQueuedFrames.end()) {
+            return;
+        }
+    }
     mInterceptor->interceptFrame(frameNumber, slot, buffer, timestamp, acquireFence, true);
     mTimings->receivedFrameTimings(systemTime(SYSTEM_TIME_MONOTONIC), slot);
 }

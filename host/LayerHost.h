@@ -53,7 +53,9 @@ public:
     // ends, the frames still queued are handed back. Refreshes and buffers must have stopped.
     void stop();
 
-    // The buffer queue's side.
+    // The buffer queue's side. An acquisition that comes after the engine has already let the frame
+    // go (a release picker may release a queued frame while the queue is acquiring it) is ignored,
+    // so that the frame does not come back into the engine's queue.
     void onBufferDequeued(int slot, nsecs_t requestTime, nsecs_t dequeueTime);
     void onBufferQueued(uint64_t frameNumber, int slot,
                         const android::sp<android::GraphicBuffer>& buffer, nsecs_t timestamp,
@@ -81,6 +83,7 @@ private:
                                                 android::Interpolation::eBufferComposedEvent;
 
     void noteQueueChange();
+    void noteFrameLeft(uint64_t frameNumber, int slot);
     void releaseLoop(android::sp<android::Interpolation::ReleasePicker> picker);
     void recordReleases();
 
@@ -103,10 +106,16 @@ private:
     std::condition_variable mQueueChanged;
     uint64_t mQueueChanges = 0;  // guarded by mChangeMutex
 
+    // Held across the acquisition of a frame and across the release thread's removals, so that
+    // a frame is never acquired into the queue after it left it. Taken before the list's mutex.
+    std::mutex mAcquireMutex;
+
     // Frames that left the list, whose release the frame timings have not recorded yet: the
     // listener cannot record them itself, since that broadcasts from inside a broadcast.
     std::mutex mReleasedMutex;
     std::vector<int> mReleasedSlots;  // guarded by mReleasedMutex
+    // Frames queued into the engine that have not left it yet; at most one per buffer.
+    std::vector<uint64_t> mQueuedFrames;  // guarded by mReleasedMutex
     std::mutex mRecordingMutex;
     std::vector<int> mReleasedScratch;  // guarded by mRecordingMutex
 };

@@ -21,6 +21,10 @@ struct Timer {
 
     bool isDue(nsecs_t now) const;
 
+    // A new period that keeps the next firing in place relative to it: nextTime moves by the
+    // change of period.
+    void changePeriod(nsecs_t newPeriod);
+
     // The timer check, reading the clock once and only when the timer is enabled.
     void check();
     // The timer check at `now`: while due, advances nextTime by a period and calls the callback;

@@ -27,6 +27,11 @@ bool Timer::isDue(nsecs_t now) const {
     return saturatingAdd(now, slack) > nextTime;
 }
 
+void Timer::changePeriod(nsecs_t newPeriod) {
+    nextTime = saturatingAdd(nextTime, newPeriod - period);
+    period = newPeriod;
+}
+
 void Timer::check() {
     if (period >= 1) check(systemTime(SYSTEM_TIME_MONOTONIC));
 }

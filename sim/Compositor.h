@@ -21,7 +21,10 @@ struct DisplayedLayer {
 
 // The simulated display and compositor: at every vsync it latches the layers' finished buffers,
 // asks the engine what to compose, blends the buffers' pixels with the state's alphas into the
-// picture on screen (one scanline of it is recorded), and hands the frames back.
+// picture on screen (one scanline of it is recorded), and hands the frames back. Each refresh
+// reaches the screen one period after its vsync, when its present fence signals. A display that
+// fell behind real time skips the vsyncs it missed, as a real one would; refresh indices count
+// vsyncs, so the skipped ones show as gaps.
 class Compositor {
 public:
     Compositor(nsecs_t refreshPeriod, uint32_t width, std::vector<DisplayedLayer> layers);
@@ -35,15 +38,14 @@ public:
 private:
     struct Screen {
         std::vector<uint8_t> scanline;  // what the layer shows now
-        double contentTime = -1;
     };
 
     void run(nsecs_t firstVsync);
-    void refresh(size_t layer, uint64_t index, nsecs_t vsync,
+    void refresh(size_t layer, uint64_t index, nsecs_t vsync, nsecs_t present,
                  const std::shared_ptr<android::FenceTime>& presentFence);
-    // Blends the state's items into the layer's scanline.
-    void blend(const android::Interpolation::RenderState& state, std::vector<ComposedItem>& items,
-               Screen& screen, LayerRecorder& recorder);
+    // Blends the state's items into the layer's scanline, and notes each item's weight in it.
+    void blend(const android::Interpolation::RenderState& state, RefreshRecord& record,
+               Screen& screen);
 
     const nsecs_t mRefreshPeriod;
     const uint32_t mWidth;

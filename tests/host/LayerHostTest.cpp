@@ -5,6 +5,7 @@
 #include <mutex>
 #include <set>
 
+#include "host/BufferCount.h"
 #include "host/LayerHost.h"
 #include "support/Frames.h"
 
@@ -67,10 +68,56 @@ TEST_P(LayerHostTest, tearDownWithAStateStillLockedReturnsEveryFrameOnce) {
     EXPECT_EQ(0u, host->frameList()->size());
 }
 
+TEST_P(LayerHostTest, aFrameAcquiredAfterItLeftTheQueueDoesNotComeBack) {
+    // A picker may release a queued frame while the buffer queue is acquiring it.
+    std::unique_ptr<LayerHost> host = makeHost();
+    const sp<GraphicBuffer> buffer = new GraphicBuffer(1, 1, PIXEL_FORMAT_RGBA_8888);
+    const sp<Fence> fence = Fence::createSignalled(0);
+    const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
+    host->onBufferQueued(1, 0, buffer, now, fence);
+    host->frameList()->clearEveryFrame();
+    host->onBufferAcquired(1, 0, buffer, now, fence);
+    EXPECT_EQ(0u, host->frameList()->size());
+    host->stop();
+    EXPECT_THAT(returned(), testing::ElementsAre(1u));
+}
+
 INSTANTIATE_TEST_SUITE_P(AllModes, LayerHostTest, testing::Range(0u, 6u),
                          [](const testing::TestParamInfo<uint32_t>& info) {
                              return "mode" + std::to_string(info.param);
                          });
+
+struct Sizing {
+    int32_t queueSize;
+    InterpolationMode mode;
+    nsecs_t delayMs;
+    double hz;
+    uint32_t count;
+};
+
+TEST(BufferCountTest, holdsTheDelayAtTheRefreshRateWithinBounds) {
+    const Sizing cases[] = {
+            {-1, eRetimeMode, 100, 120, 14},  // 12 frames within the delay, the shown, the drawn
+            {-1, eRetimeMode, 100, 60, 8},    {-1, eRetimeMode, 64, 60, 6},
+            {-1, eNoInterpMode, 0, 120, 3},   {-1, eFillInMode, 0, 60, 5},
+            {-1, eRetimeMode, 100, 1000, 64},  // the queue's slots end there
+            {4, eRetimeMode, 100, 120, 4},
+    };
+    for (const Sizing& c : cases) {
+        const BufferCount count = bufferCountFor(c.queueSize, c.mode, c.delayMs * 1'000'000,
+                                                 std::llround(1e9 / c.hz));
+        EXPECT_EQ(c.count, count.count) << c.delayMs << " ms at " << c.hz << " Hz";
+        EXPECT_EQ(c.queueSize >= 1, count.fixed);
+    }
+    // The automatic delay may climb to the delayer's ceiling; a fixed one stays.
+    Settings settings;
+    EXPECT_EQ(100'000'000, longestDisplayDelay(eRetimeMode, true, 64, settings));
+    settings.smartDelay = false;
+    settings.delayMs = 40;
+    EXPECT_EQ(40'000'000, longestDisplayDelay(eRetimeMode, true, 64, settings));
+    EXPECT_EQ(0, longestDisplayDelay(eRetimeMode, false, 64, settings));
+    EXPECT_EQ(0, longestDisplayDelay(eJustInTimeMode, true, 64, settings));
+}
 
 }  // namespace
 }  // namespace verolux::host
