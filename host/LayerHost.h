@@ -22,6 +22,10 @@
 #include "RealFPSTracker.h"
 #include "ReleasePicker.h"
 #include "RenderStateBuilder.h"
+#include "host/LayerMonitor.h"
+#include "host/LayerRates.h"
+#include "host/LayerSettings.h"
+#include "host/RefreshClassifier.h"
 #include "host/RetiredFences.h"
 #include "host/SettingsMessage.h"
 
@@ -31,8 +35,23 @@ namespace verolux::host {
 // for its mode, hands them every buffer the game queues and acquires, asks for a state at every
 // refresh and gives the frames back after composing, and runs the release thread. Frames that leave
 // the frame list, by whichever path, are handed back through the FrameReleasedCallback.
+//
+// Around that it runs the layer's rates (LayerRates), statistics and watchdogs (LayerMonitor). A
+// layer whose settings do not interpolate it (gameFpsLimit below 1, as after a watchdog switched
+// the game off) is composed as the platform composes any layer: the host latches the newest
+// acquired frame itself, shows it whole, and lets every older frame go.
 class LayerHost {
 public:
+    enum class CompositionType { DEVICE, CLIENT };
+
+    // What the host reports of the layer besides its pictures.
+    struct Status {
+        int32_t refreshRate = 0;            // the detected refresh rate, Hz
+        int32_t gameRateLimit = 0;          // the game-rate agent's limit, 0 before the first
+        bool gameRateLimitApplied = false;  // the game is held to it (gfpsOffsetEnabled)
+        bool interpolating = false;         // the settings interpolate the layer
+    };
+
     struct Config {
         android::String8 name;
         uint32_t uid = 0;
@@ -60,6 +79,8 @@ public:
     // go (a release picker may release a queued frame while the queue is acquiring it) is ignored,
     // so that the frame does not come back into the engine's queue.
     void onBufferDequeued(int slot, nsecs_t requestTime, nsecs_t dequeueTime);
+    // The producer found no free buffer and waits for one.
+    void onBufferBackpressure();
     void onBufferQueued(uint64_t frameNumber, int slot,
                         const android::sp<android::GraphicBuffer>& buffer, nsecs_t timestamp,
                         const android::sp<android::Fence>& acquireFence);
@@ -67,11 +88,24 @@ public:
                           const android::sp<android::GraphicBuffer>& buffer, nsecs_t timestamp,
                           const android::sp<android::Fence>& acquireFence);
 
-    // The display's side: the state to compose for `displayTime`; its frames stay locked until
-    // onCompositionDone.
-    android::Interpolation::RenderState compose(nsecs_t displayTime);
+    // The display's side, on one thread, at every refresh: onVsync, which says whether the layer
+    // presents at this refresh; when it does, compose, the state for `displayTime`, whose frames
+    // stay locked until onCompositionDone; then onCompositionDone always, with the composed state
+    // (an empty one when the layer did not present: it keeps its previous picture).
+    bool onVsync(nsecs_t vsync);
+    const android::Interpolation::RenderState& compose(nsecs_t displayTime);
     void onCompositionDone(const android::Interpolation::RenderState& state, nsecs_t displayTime,
-                           const std::shared_ptr<android::FenceTime>& presentFence);
+                           const std::shared_ptr<android::FenceTime>& presentFence,
+                           CompositionType type = CompositionType::DEVICE);
+
+    Status status() const;
+    // The frame-event counts of the second before `now`.
+    FrameRateStatistics statistics(nsecs_t now) const;
+    // The layer in the platform's dumpsys style: the frame list, the delay, the statistics line,
+    // the version block and the settings line.
+    void dump(android::String8& out) const;
+    // The layer's event ring log, as the controlling service reads it.
+    void writeRingLog(android::Parcel& out) const;
 
     const Config& config() const { return mConfig; }
     const android::sp<android::FrameList>& frameList() const { return mFrameList; }
@@ -86,6 +120,9 @@ private:
     void releaseLoop(android::sp<android::Interpolation::ReleasePicker> picker);
     void setLeavingFrame(uint64_t frameNumber);
     void recordReleases();
+    void latchNewestFrame();
+    // Lets go the frames that no later refresh will show.
+    void clearUnusedFrames(nsecs_t displayTime);
 
     const Config mConfig;
     const android::sp<android::FrameList> mFrameList;
@@ -101,6 +138,16 @@ private:
     // Frames leaving the list, to hand them back, and the events after which the picker may
     // decide otherwise, to ask it again when it had nothing to release.
     uint32_t mListenedEvents = 0;
+    const android::sp<LayerSettings> mSettings;
+    // Before the rates, so that the ring log hears the render-rate agent's first announcement.
+    LayerMonitor mMonitor;
+    LayerRates mRates;
+
+    // The composition thread's own.
+    android::Interpolation::RenderState mState;  // reused, so that latching allocates nothing
+    bool mPresenting = true;
+    bool mLatchedByHost = false;
+    RefreshClassifier mClassifier;
 
     std::atomic<bool> mRunning{false};
     std::thread mReleaseThread;
@@ -126,8 +173,8 @@ private:
     std::mutex mRecordingMutex;
     std::vector<int> mReleasedScratch;  // guarded by mRecordingMutex
 
-    // The fences of frames composed or removed on the composition thread; the buffer queue's
-    // thread drops them.
+    // The fences of frames the composition thread is done with; the buffer queue's thread drops
+    // them.
     RetiredFences mRetiredFences;
 };
 

@@ -7,10 +7,10 @@ RetiredFences::RetiredFences() {
     mDropping.reserve(CAPACITY);
 }
 
-void RetiredFences::retire(const android::Interpolation::RenderState& composed) {
+void RetiredFences::retire(android::Interpolation::RenderState& done) {
     std::lock_guard lock(mMutex);
-    for (const android::Interpolation::RenderItem& item : composed.items)
-        keepLocked(item.frame.mAcquireFence);
+    for (android::Interpolation::RenderItem& item : done.items)
+        keepLocked(std::move(item.frame.mAcquireFence));
 }
 
 void RetiredFences::retire(std::vector<android::FrameItem>& removed) {

@@ -20,10 +20,9 @@ public:
 
     RetiredFences();
 
-    // The fences of the frames composed: the queue may let them go before the composition's own
-    // copies drop.
-    void retire(const android::Interpolation::RenderState& composed);
-    // The fences of frames taken out of the queue; the frames give them up.
+    // The fences of a composed state that is done with, which the queue may have let go of
+    // meanwhile, and of frames taken out of the queue. The frames give their fences up.
+    void retire(android::Interpolation::RenderState& done);
     void retire(std::vector<android::FrameItem>& removed);
     // Drops what was kept, on the calling thread. Not called on two threads at once.
     void drop();

@@ -14,6 +14,8 @@ using android::Interpolation::RenderState;
 
 namespace {
 
+constexpr nsecs_t SECOND = 1'000'000'000;
+
 nsecs_t threadCpuTime() {
     timespec ts{};
     clock_gettime(CLOCK_THREAD_CPUTIME_ID, &ts);
@@ -22,12 +24,15 @@ nsecs_t threadCpuTime() {
 
 }  // namespace
 
-Compositor::Compositor(nsecs_t refreshPeriod, uint32_t width, std::vector<DisplayedLayer> layers)
+Compositor::Compositor(nsecs_t refreshPeriod, uint32_t width, std::vector<DisplayedLayer> layers,
+                       double clientCompositionShare, uint64_t seed)
     : mRefreshPeriod(refreshPeriod),
       mWidth(width),
       mLayers(std::move(layers)),
       mScreens(mLayers.size()),
-      mAccumulator(size_t{width} * 3) {
+      mAccumulator(size_t{width} * 3),
+      mClientCompositionShare(clientCompositionShare),
+      mRandom(seed) {
     for (Screen& screen : mScreens)
         screen.scanline.assign(size_t{width} * 3, 0);
 }
@@ -51,6 +56,9 @@ void Compositor::stop() {
 
 void Compositor::run(nsecs_t firstVsync) {
     nsecs_t vsync = firstVsync;
+    for (Screen& screen : mScreens)
+        screen.nextStatistics = firstVsync + SECOND;
+    std::uniform_real_distribution<double> draw(0.0, 1.0);
     while (true) {
         {
             std::unique_lock lock(mMutex);
@@ -62,8 +70,10 @@ void Compositor::run(nsecs_t firstVsync) {
         const nsecs_t present = vsync + mRefreshPeriod;
         const auto presentFence =
                 std::make_shared<android::FenceTime>(android::Fence::createSignalled(present));
+        const bool clientComposed =
+                mClientCompositionShare > 0 && draw(mRandom) < mClientCompositionShare;
         for (size_t layer = 0; layer < mLayers.size(); layer++) {
-            refresh(layer, index, vsync, present, presentFence);
+            refresh(layer, index, vsync, present, presentFence, clientComposed);
         }
         vsync += mRefreshPeriod;
         const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
@@ -73,7 +83,8 @@ void Compositor::run(nsecs_t firstVsync) {
 }
 
 void Compositor::refresh(size_t layerIndex, uint64_t index, nsecs_t vsync, nsecs_t present,
-                         const std::shared_ptr<android::FenceTime>& presentFence) {
+                         const std::shared_ptr<android::FenceTime>& presentFence,
+                         bool clientComposed) {
     const DisplayedLayer& layer = mLayers[layerIndex];
     LayerRecorder& recorder = *layer.recorder;
     layer.queue->acquireReady([&](const BufferQueue::QueuedBuffer& queued) {
@@ -90,8 +101,11 @@ void Compositor::refresh(size_t layerIndex, uint64_t index, nsecs_t vsync, nsecs
     record.presentTime = present;
 
     const nsecs_t cpuBefore = threadCpuTime();
-    const RenderState state = layer.host->compose(vsync);
+    const bool presents = layer.host->onVsync(vsync);
+    const RenderState& state = presents ? layer.host->compose(vsync) : mNothing;
     const nsecs_t cpuComposed = threadCpuTime();
+    record.refused = !presents;
+    record.clientComposed = clientComposed;
 
     // With nothing to draw, the previous picture stays on screen.
     Screen& screen = mScreens[layerIndex];
@@ -99,11 +113,23 @@ void Compositor::refresh(size_t layerIndex, uint64_t index, nsecs_t vsync, nsecs
     recorder.composed(record);
 
     const nsecs_t cpuReturning = threadCpuTime();
-    layer.host->onCompositionDone(state, vsync, presentFence);
+    layer.host->onCompositionDone(state, vsync, presentFence,
+                                  clientComposed ? host::LayerHost::CompositionType::CLIENT
+                                                 : host::LayerHost::CompositionType::DEVICE);
     record.cpuTime = (cpuComposed - cpuBefore) + (threadCpuTime() - cpuReturning);
     record.queueLength = static_cast<uint32_t>(layer.host->frameList()->size());
     record.scanline = screen.scanline;
+    const host::LayerHost::Status status = layer.host->status();
+    record.interpolating = status.interpolating;
+    record.refreshRate = status.refreshRate;
+    record.gameRateLimit = status.gameRateLimit;
+    record.gameRateLimitApplied = status.gameRateLimitApplied;
     recorder.refreshed(std::move(record));
+
+    if (vsync >= screen.nextStatistics) {
+        recorder.statistics({vsync, layer.host->statistics(vsync)});
+        screen.nextStatistics += SECOND * ((vsync - screen.nextStatistics) / SECOND + 1);
+    }
 }
 
 void Compositor::blend(const RenderState& state, RefreshRecord& record, Screen& screen) {

@@ -46,7 +46,7 @@ void FramesCsv::onFrame(const FrameRecord& frame) {
 
 RefreshesCsv::RefreshesCsv(std::ostream& out, nsecs_t origin) : mOut(out), mOrigin(origin) {
     mOut << "refresh,vsync_ns,present_ns,picture,frame0,alpha0,frame1,alpha1,content_ns,delay_ns,"
-            "cpu_ns\n";
+            "cpu_ns,refused,client,refresh_hz,game_limit_fps\n";
 }
 
 void RefreshesCsv::onRefresh(const RefreshRecord& refresh) {
@@ -67,7 +67,10 @@ void RefreshesCsv::onRefresh(const RefreshRecord& refresh) {
     if (refresh.contentTime >= 0) mOut << std::llround(refresh.contentTime) - mOrigin;
     mOut << ',';
     if (refresh.delay >= 0) mOut << refresh.delay;
-    mOut << ',' << refresh.cpuTime << '\n';
+    mOut << ',' << refresh.cpuTime << ',' << int{refresh.refused} << ','
+         << int{refresh.clientComposed} << ',' << refresh.refreshRate << ',';
+    if (refresh.gameRateLimitApplied) mOut << refresh.gameRateLimit;
+    mOut << '\n';
 }
 
 PresentMonCsv::PresentMonCsv(std::ostream& out, nsecs_t origin, std::string application,

@@ -10,6 +10,7 @@ namespace verolux::sim {
 namespace {
 
 constexpr nsecs_t MS = 1'000'000;
+constexpr nsecs_t SECOND = 1'000'000'000;
 // The bar crosses the picture in two seconds of game time: a few pixels per refresh, so that even
 // pacing draws a straight edge in the space-time picture and uneven pacing draws steps.
 constexpr nsecs_t CROSSING_TIME = 2'000'000'000;
@@ -96,7 +97,7 @@ void Game::run(nsecs_t startTime) {
         if (!sleepUntil(frameStart)) return;
 
         const nsecs_t requestTime = systemTime(SYSTEM_TIME_MONOTONIC);
-        const int slot = mQueue.dequeue();
+        const int slot = mQueue.dequeue([this] { mHost.onBufferBackpressure(); });
         if (slot < 0) return;
         const nsecs_t dequeueTime = systemTime(SYSTEM_TIME_MONOTONIC);
         // A game that had to wait for a buffer simulates its world from when it got one.
@@ -130,6 +131,11 @@ void Game::run(nsecs_t startTime) {
             }
         }
         frameStart = std::max(frameStart + interval, systemTime(SYSTEM_TIME_MONOTONIC));
+        // Held to the game-rate limit, as the controlling service would hold it.
+        const host::LayerHost::Status status = mHost.status();
+        if (status.gameRateLimitApplied) {
+            frameStart = std::max(frameStart, requestTime + SECOND / status.gameRateLimit);
+        }
     }
     // A finished capture leaves the game idle until the run ends.
     sleepUntil(std::numeric_limits<nsecs_t>::max());

@@ -27,7 +27,9 @@ struct GameConfig {
 // is free), draws a bar moving at constant speed through its own time, lets the simulated GPU
 // finish it after the render time, and queues it. A replayed capture gives the intervals between
 // frames and their render times. A game that had to wait starts its next frame one interval after
-// the late one, not at its old time: waiting slows it down, as it would a real game.
+// the late one, not at its old time: waiting slows it down, as it would a real game. While the
+// host applies a game-rate limit, the game starts no frame sooner than one limit period after the
+// previous one started.
 class Game {
 public:
     Game(GameConfig config, BufferQueue& queue, host::LayerHost& host, FenceSignaller& gpu,

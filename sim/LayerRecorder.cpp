@@ -162,6 +162,16 @@ void LayerRecorder::frameReleased(uint64_t number, nsecs_t releaseTime) {
     completeLocked(done);
 }
 
+void LayerRecorder::statistics(const StatisticsRecord& statistics) {
+    std::lock_guard lock(mMutex);
+    mSink.onStatistics(statistics);
+}
+
+void LayerRecorder::warning(const WarningRecord& warning) {
+    std::lock_guard lock(mMutex);
+    mSink.onWarning(warning);
+}
+
 void LayerRecorder::completeLocked(const FrameRecord& frame) {
     if (frame.number < mNextFrame) {
         // Overtaken by later frames already (see below).

@@ -47,6 +47,9 @@ public:
     void refreshed(RefreshRecord refresh);
     // Whichever thread took the frame out of the engine's queue.
     void frameReleased(uint64_t number, nsecs_t releaseTime);
+    // The library's per-second statistics, and a warning the settings client read back.
+    void statistics(const StatisticsRecord& statistics);
+    void warning(const WarningRecord& warning);
 
     size_t frameCount() const { return mFrameCount.load(); }
     size_t refreshCount() const { return mRefreshCount.load(); }

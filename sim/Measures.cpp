@@ -30,7 +30,20 @@ Rates ratesOf(const Histogram& frameTimes) {
     return rates;
 }
 
+std::array<int64_t, 7> statisticValues(const host::FrameRateStatistics& s) {
+    return {s.gameFps,   static_cast<int64_t>(s.realFps),
+            s.actualFps, s.interpolatedFps,
+            s.missedFps, s.repeatedFps,
+            s.skippedFps};
+}
+
 }  // namespace
+
+const std::array<const char*, 7>& statisticNames() {
+    static const std::array<const char*, 7> NAMES = {"game",   "real",     "actual", "interpolated",
+                                                     "missed", "repeated", "skipped"};
+    return NAMES;
+}
 
 // Frame times, latencies and ages: 10 us bins to 100 ms, 1 ms bins to 10 s. CPU time: 100 ns bins
 // to 1 ms, 10 us bins to 100 ms.
@@ -59,6 +72,27 @@ void Measures::onFrame(const FrameRecord& frame) {
 
 void Measures::onRefresh(const RefreshRecord& refresh) {
     mRefreshes++;
+    MeasuredLayer& h = mHost;
+    if (h.detectedRefreshRate != refresh.refreshRate) h.refreshRateSettled = refresh.presentTime;
+    h.detectedRefreshRate = refresh.refreshRate;
+    h.refusedPresentations += refresh.refused;
+    h.clientCompositions += refresh.clientComposed;
+    if (refresh.gameRateLimit > 0) {
+        if (!h.firstGameRateLimit) h.firstGameRateLimit = refresh.gameRateLimit;
+        h.lastGameRateLimit = refresh.gameRateLimit;
+        h.lowestGameRateLimit = std::min(h.lowestGameRateLimit.value_or(refresh.gameRateLimit),
+                                         refresh.gameRateLimit);
+    }
+    h.gameRateLimitApplied = refresh.gameRateLimitApplied;
+    if (refresh.gameRateLimitApplied && !h.gameRateLimitAppliedFrom) {
+        h.gameRateLimitAppliedFrom = refresh.presentTime;
+    }
+    if (refresh.interpolating) {
+        h.interpolatedAtAll = true;
+    } else if (h.interpolatedAtAll && !h.interpolationOffAt) {
+        h.interpolationOffAt = refresh.presentTime;
+    }
+
     mPictures[static_cast<size_t>(refresh.picture)]++;
     mCpu.add(refresh.cpuTime);
     if (mLastIndex && refresh.index > *mLastIndex + 1) {
@@ -101,8 +135,29 @@ void Measures::onDelayChange(nsecs_t time, nsecs_t delay) {
     mDelayChanges++;
 }
 
+void Measures::onStatistics(const StatisticsRecord& statistics) {
+    const std::array<int64_t, 7> values = statisticValues(statistics.rates);
+    for (size_t i = 0; i < values.size(); i++) {
+        MeasuredLayer::Spread& spread = mHost.statistics[i];
+        spread.min = mHost.statisticSeconds == 0 ? values[i] : std::min(spread.min, values[i]);
+        spread.max = mHost.statisticSeconds == 0 ? values[i] : std::max(spread.max, values[i]);
+        mStatisticSums[i] += values[i];
+    }
+    mHost.statisticSeconds++;
+    mHost.lastStatistics = statistics.rates;
+}
+
+void Measures::onWarning(const WarningRecord& warning) {
+    if (mHost.warnings.size() < MAX_LEDGER) mHost.warnings.push_back(warning);
+    mHost.warningCount++;
+}
+
 MeasuredLayer Measures::result() const {
-    MeasuredLayer m;
+    MeasuredLayer m = mHost;
+    for (size_t i = 0; i < m.statistics.size() && m.statisticSeconds > 0; i++) {
+        m.statistics[i].mean =
+                static_cast<double>(mStatisticSums[i]) / static_cast<double>(m.statisticSeconds);
+    }
     m.framesQueued = mFramesQueued;
     m.gameFps = ratesOf(mGameFrameTimes);
     m.bufferWaitMs = static_cast<double>(mBufferWait) / NS_PER_MS;

@@ -54,7 +54,34 @@ struct MeasuredLayer {
     uint64_t delayChanges = 0;  // after the first delay
 
     std::optional<double> cpuMeanUs, cpuP99Us;
+
+    // What the host reported at the refreshes.
+    std::optional<int32_t> detectedRefreshRate;  // at the last refresh
+    std::optional<nsecs_t> refreshRateSettled;   // present time from which it held that value
+    uint64_t refusedPresentations = 0;
+    uint64_t clientCompositions = 0;
+    std::optional<int32_t> firstGameRateLimit, lastGameRateLimit, lowestGameRateLimit;
+    std::optional<nsecs_t> gameRateLimitAppliedFrom;  // the first refresh it was applied at
+    bool gameRateLimitApplied = false;                // at the last refresh
+    bool interpolatedAtAll = false;
+    std::optional<nsecs_t> interpolationOffAt;  // the first refresh without it, after one with it
+
+    // The library's per-second statistics: mean, lowest and highest over the seconds sampled.
+    struct Spread {
+        double mean = 0;
+        int64_t min = 0;
+        int64_t max = 0;
+    };
+    uint64_t statisticSeconds = 0;
+    std::array<Spread, 7> statistics{};  // in the order of statisticNames()
+    std::optional<host::FrameRateStatistics> lastStatistics;
+
+    std::vector<WarningRecord> warnings;  // the first MAX_LEDGER
+    uint64_t warningCount = 0;
 };
+
+// "game", "real", "actual", "interpolated", "missed", "repeated", "skipped".
+const std::array<const char*, 7>& statisticNames();
 
 // Computes a layer's measures from its records as they come, in memory that does not grow with
 // the run's length.
@@ -62,12 +89,15 @@ class Measures final : public RecordSink {
 public:
     static constexpr size_t MAX_LISTED_STUTTERS = 256;
     static constexpr double STUTTER_FACTOR = 1.5;
+    static constexpr size_t MAX_LEDGER = 1000;
 
     explicit Measures(nsecs_t refreshPeriod);
 
     void onFrame(const FrameRecord& frame) override;
     void onRefresh(const RefreshRecord& refresh) override;
     void onDelayChange(nsecs_t time, nsecs_t delay) override;
+    void onStatistics(const StatisticsRecord& statistics) override;
+    void onWarning(const WarningRecord& warning) override;
 
     MeasuredLayer result() const;
 
@@ -105,6 +135,10 @@ private:
     std::optional<nsecs_t> mFirstDelay;
     nsecs_t mLastDelay = -1;
     uint64_t mDelayChanges = 0;
+
+    // Host side; the statistics as sums, lowest and highest.
+    MeasuredLayer mHost;
+    std::array<int64_t, 7> mStatisticSums{};
 };
 
 }  // namespace verolux::sim

@@ -30,6 +30,8 @@ const RealOption REAL_OPTIONS[] = {
         {"--duration", &Options::durationSec, 0, false, 3600,
          "must be greater than 0 and at most 3600 seconds"},
         {"--picture-at", &Options::pictureAtSec, 0, true, 3600, "must be between 0 and 3600"},
+        {"--client-composition", &Options::clientCompositionShare, 0, true, 1,
+         "must be between 0 and 1"},
 };
 
 struct WholeOption {
@@ -220,9 +222,14 @@ Display and library:
                        4 unlimited, 5 latency reduction
   --slots N          buffers of the game's queue, 2 to 64 (default: enough for the display
                      delay at the refresh rate; the queueSize setting fixes it too)
+  --client-composition SHARE
+                     share of compositions, 0 to 1, that fall back to client (GPU)
+                     composition, drawn from the seed (default 0)
   --settings FILE    settings as a JSON object of the keys below
   --set KEY=VALUE    one setting, after those of --settings; may repeat
-                     (e.g. --set delayMs=48 --set alphaFunction=0,0,0.5,1,1,1)
+                     (e.g. --set delayMs=48 --set alphaFunction=0,0,0.5,1,1,1); gameFpsLimit
+                     is the refresh rate unless set (interpolation is on from 1 upwards);
+                     gfpsOffsetEnabled=1 holds the game to the game-rate limit
 Run and output:
   --duration S       seconds to run (default 10, or the capture's length; at most 3600)
   --out DIR          output folder (default sim-out)

@@ -16,6 +16,7 @@ struct Options {
     double jitterMs = 1;
     double renderMs = 8;  // mean GPU time of a frame
     double hz = 60;
+    double clientCompositionShare = 0;  // compositions that fall back to client composition
     uint32_t mode = 0;
     uint32_t slots = 0;  // buffer-queue slots; 0: sized by the reference host
     double durationSec = 10;

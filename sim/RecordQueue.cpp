@@ -19,6 +19,10 @@ void RecordQueue::drainInto(RecordSink& sink) {
             sink.onRefresh(*refresh);
         } else if (const auto* change = std::get_if<DelayChange>(&record)) {
             sink.onDelayChange(change->time, change->delay);
+        } else if (const auto* statistics = std::get_if<StatisticsRecord>(&record)) {
+            sink.onStatistics(*statistics);
+        } else if (const auto* warning = std::get_if<WarningRecord>(&record)) {
+            sink.onWarning(*warning);
         }
     }
     mDraining.clear();

@@ -16,6 +16,8 @@ public:
     void onFrame(const FrameRecord& frame) override { push(frame); }
     void onRefresh(const RefreshRecord& refresh) override { push(refresh); }
     void onDelayChange(nsecs_t time, nsecs_t delay) override { push(DelayChange{time, delay}); }
+    void onStatistics(const StatisticsRecord& statistics) override { push(statistics); }
+    void onWarning(const WarningRecord& warning) override { push(warning); }
 
     // Hands everything queued so far to `sink`, in the order it came.
     void drainInto(RecordSink& sink);
@@ -25,7 +27,8 @@ private:
         nsecs_t time;
         nsecs_t delay;
     };
-    using Record = std::variant<FrameRecord, RefreshRecord, DelayChange>;
+    using Record =
+            std::variant<FrameRecord, RefreshRecord, DelayChange, StatisticsRecord, WarningRecord>;
 
     void push(Record record);
 

@@ -6,6 +6,8 @@
 #include <cstdint>
 #include <vector>
 
+#include "host/FrameRateStatistics.h"
+
 namespace verolux::sim {
 
 // What one simulated layer did, as records that the measures and the output writers take one at
@@ -60,6 +62,29 @@ struct RefreshRecord {
     nsecs_t cpuTime = 0;            // the library's CPU time for this refresh (thread CPU clock)
     uint32_t queueLength = 0;       // frames in the engine's queue after composing
     std::vector<uint8_t> scanline;  // one RGB scanline of the picture; may be empty
+
+    // The host's side of the refresh.
+    bool refused = false;         // the render-rate agent refused the presentation
+    bool clientComposed = false;  // the composition fell back to client composition
+    bool interpolating = true;    // the layer's settings interpolated it
+    int32_t refreshRate = 0;      // the detected refresh rate, Hz
+    int32_t gameRateLimit = 0;    // the game-rate agent's limit, 0 before the first
+    bool gameRateLimitApplied = false;
+};
+
+// The layer's frame-rate statistics as the library counts them, sampled once a second.
+struct StatisticsRecord {
+    nsecs_t time = -1;
+    host::FrameRateStatistics rates;
+};
+
+// A watchdog's warning, as the settings client read it back.
+struct WarningRecord {
+    nsecs_t time = -1;   // on the run's clock, from the warning's wall-clock time
+    int64_t wallMs = 0;  // the warning's own time stamp: wall-clock ms since the epoch
+    int32_t code = 0;    // WarningCode
+    bool floatValue = false;
+    double value = 0;
 };
 
 // Receives a layer's records in the order they complete: refreshes in present order, frames in
@@ -71,6 +96,8 @@ public:
     virtual void onFrame(const FrameRecord& frame) {}
     virtual void onRefresh(const RefreshRecord& refresh) {}
     virtual void onDelayChange(nsecs_t time, nsecs_t delay) {}
+    virtual void onStatistics(const StatisticsRecord& statistics) {}
+    virtual void onWarning(const WarningRecord& warning) {}
 };
 
 // Hands every record on to several sinks, in the order they were added.
@@ -88,6 +115,14 @@ public:
     void onDelayChange(nsecs_t time, nsecs_t delay) override {
         for (RecordSink* sink : mSinks)
             sink->onDelayChange(time, delay);
+    }
+    void onStatistics(const StatisticsRecord& statistics) override {
+        for (RecordSink* sink : mSinks)
+            sink->onStatistics(statistics);
+    }
+    void onWarning(const WarningRecord& warning) override {
+        for (RecordSink* sink : mSinks)
+            sink->onWarning(warning);
     }
 
 private:

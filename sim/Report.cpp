@@ -47,6 +47,7 @@ std::string html(const std::string& text) {
 constexpr const char* STYLE = R"(
 body { font-family: sans-serif; margin: 24px; color: #222; }
 h1 { font-size: 22px; margin: 0 0 12px; }
+h2 { font-size: 16px; margin: 20px 0 6px; }
 ul.findings { background: #f4f6fa; padding: 10px 10px 10px 28px; border-radius: 6px; }
 ul.findings li { margin: 4px 0; }
 .tables { display: flex; gap: 32px; align-items: flex-start; flex-wrap: wrap; }
@@ -141,7 +142,10 @@ Status writeReport(const std::string& folder,
         if (reference != nullptr) out << "<td>" << html(row.reference) << "</td>";
         out << "</tr>\n";
     }
-    out << "</table>\n</div>\n<div class=\"figures\">\n";
+    out << "</table>\n</div>\n<h2>Watchdog warnings</h2>\n<pre>";
+    for (const std::string& line : ledgerLines(run, reference))
+        out << html(line) << "\n";
+    out << "</pre>\n<div class=\"figures\">\n";
     for (const Figure& figure : figures()) {
         if (!std::filesystem::exists(std::filesystem::path(folder) / figure.file)) continue;
         out << "<figure><img src=\"" << figure.file << "\" alt=\"" << figure.file

@@ -7,8 +7,11 @@
 #include <memory>
 #include <thread>
 
+#include <binder/Parcel.h>
+
 #include "SettingsController.h"
 #include "Tunables.h"
+#include "WatchdogWarningController.h"
 #include "host/LayerHost.h"
 #include "sim/BufferQueue.h"
 #include "sim/Compositor.h"
@@ -16,6 +19,7 @@
 #include "sim/Game.h"
 #include "sim/LayerRecorder.h"
 #include "sim/RecordQueue.h"
+#include "sim/WarningLedger.h"
 
 namespace verolux::sim {
 
@@ -25,6 +29,7 @@ namespace {
 
 constexpr nsecs_t MS = 1'000'000;
 constexpr nsecs_t SECOND = 1'000'000'000;
+constexpr int32_t GAME_FPS_LIMIT_ID = 0;
 constexpr int32_t APPLY_DELAY_TO_FRAMES_ID = 116;
 // Enough for the caller to open its outputs before the first vsync.
 constexpr nsecs_t START_MARGIN = 250 * MS;
@@ -54,6 +59,21 @@ struct SimulatedLayer {
     std::unique_ptr<Game> game;
 };
 
+// Reads the uid's warnings back as the settings client does, and records them on the run's clock.
+void readWarnings(uint32_t uid, nsecs_t startTime, int64_t startWallMs, LayerRecorder& recorder) {
+    android::Parcel parcel;
+    android::Interpolation::WatchdogWarningController::writeWarningsToParcel(uid, &parcel);
+    parcel.setDataPosition(0);
+    DecodedWarnings decoded = decodeWarnings(parcel);
+    for (WarningRecord& warning : decoded.warnings) {
+        warning.time = startTime + (warning.wallMs - startWallMs) * MS;
+        recorder.warning(warning);
+    }
+    if (!decoded.error.empty()) {
+        fprintf(stderr, "verolux-sim: the warnings of uid %u: %s\n", uid, decoded.error.c_str());
+    }
+}
+
 }  // namespace
 
 Simulation::Simulation(const Options& options, std::vector<host::SettingValue> settings,
@@ -65,6 +85,7 @@ Simulation::Simulation(const Options& options, std::vector<host::SettingValue> s
     // settings come after, so they can still turn it off.
     std::vector<host::SettingValue> message;
     if (options.mode == 0) message.push_back({APPLY_DELAY_TO_FRAMES_ID, true});
+    message.push_back({GAME_FPS_LIMIT_ID, static_cast<int32_t>(std::lround(options.hz))});
     message.insert(message.end(), settings.begin(), settings.end());
 
     mLayers.push_back({"run", GAME_UID, options.mode, {}});
@@ -81,6 +102,10 @@ Simulation::Simulation(const Options& options, std::vector<host::SettingValue> s
         mInitialDelay = android::Interpolation::defaultDelay.load() * MS;
     }
     mStartTime = systemTime(SYSTEM_TIME_MONOTONIC) + START_MARGIN;
+    timespec wall{};
+    clock_gettime(CLOCK_REALTIME, &wall);
+    mStartWallMs = int64_t{wall.tv_sec} * 1000 + wall.tv_nsec / MS +
+                   (mStartTime - systemTime(SYSTEM_TIME_MONOTONIC)) / MS;
 }
 
 RunResult Simulation::run(const std::vector<RecordSink*>& sinks,
@@ -101,7 +126,8 @@ RunResult Simulation::run(const std::vector<RecordSink*>& sinks,
                                              *layer->recorder);
         displayed.push_back({&layer->queue, layer->layerHost.get(), layer->recorder.get()});
     }
-    Compositor compositor(mRefreshPeriod, mOptions.width, displayed);
+    Compositor compositor(mRefreshPeriod, mOptions.width, displayed,
+                          mOptions.clientCompositionShare, mOptions.seed);
 
     const bool untilCaptureEnds = mCapture != nullptr && !mOptions.durationGiven && !mOptions.loop;
     const nsecs_t end =
@@ -117,8 +143,10 @@ RunResult Simulation::run(const std::vector<RecordSink*>& sinks,
     compositor.start(mStartTime);
 
     auto drain = [&] {
-        for (size_t i = 0; i < layers.size(); i++)
+        for (size_t i = 0; i < layers.size(); i++) {
+            readWarnings(mLayers[i].uid, mStartTime, mStartWallMs, *layers[i]->recorder);
             layers[i]->records.drainInto(*sinks[i]);
+        }
     };
     RunResult result;
     nsecs_t nextReport = mStartTime + SECOND;
@@ -161,6 +189,15 @@ RunResult Simulation::run(const std::vector<RecordSink*>& sinks,
     for (auto& layer : layers)
         layer->game->stop();
     compositor.stop();
+    for (auto& layer : layers) {
+        android::String8 dump;
+        layer->layerHost->dump(dump);
+        result.dump += std::string(dump.c_str()) + "\n";
+        android::Parcel ringLog;
+        layer->layerHost->writeRingLog(ringLog);
+        result.ringLogs.insert(result.ringLogs.end(), ringLog.data(),
+                               ringLog.data() + ringLog.dataSize());
+    }
     for (auto& layer : layers)
         layer->layerHost->stop();
     gpu.stop();

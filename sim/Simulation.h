@@ -25,6 +25,9 @@ struct RunResult {
     nsecs_t endTime = -1;
     bool interrupted = false;
     bool captureEnded = false;
+    std::string dump;  // every layer's dump at the end of the run, before tear-down
+    // Every layer's ring log as its parcel carries it, one after the other, read at the same time.
+    std::vector<uint8_t> ringLogs;
 };
 
 // One run of verolux-sim in real time: the game and, unless left out, the same game (same seed
@@ -39,7 +42,8 @@ public:
     static constexpr nsecs_t CAPTURE_TAIL = 250'000'000;
 
     // Delivers the settings to the layers' uids and plans the layers; the run starts a moment
-    // later, at startTime().
+    // later, at startTime(). Unless the settings set gameFpsLimit, it is the refresh rate, so that
+    // the layers are interpolated.
     Simulation(const Options& options, std::vector<host::SettingValue> settings,
                const Capture* capture);
 
@@ -50,7 +54,9 @@ public:
     nsecs_t initialDelay() const { return mInitialDelay; }
 
     // Runs until the duration has passed, the capture has ended or `interrupted` is set; sinks
-    // holds one per layer. Progress lines go to `progress` when it is not null.
+    // holds one per layer. Progress lines go to `progress` when it is not null. As the settings
+    // client does, it reads each layer's watchdog warnings back as they come and hands them to
+    // the layer's sink.
     RunResult run(const std::vector<RecordSink*>& sinks, const std::atomic<bool>& interrupted,
                   std::ostream* progress);
 
@@ -61,6 +67,7 @@ private:
     std::vector<LayerPlan> mLayers;
     nsecs_t mInitialDelay = -1;
     nsecs_t mStartTime = 0;
+    int64_t mStartWallMs = 0;  // the wall-clock time at startTime, which warnings carry
 };
 
 }  // namespace verolux::sim

@@ -1,11 +1,14 @@
 #include "sim/Summary.h"
 
+#include <algorithm>
 #include <cinttypes>
 #include <cmath>
 #include <cstdarg>
 #include <cstdio>
 #include <initializer_list>
 #include <iterator>
+
+#include "sim/WarningLedger.h"
 
 namespace verolux::sim {
 
@@ -73,6 +76,52 @@ std::string delay(const MeasuredLayer& m) {
                   m.delayChanges, m.delayChanges == 1 ? "" : "s");
 }
 
+std::string seconds(const Summary& s, nsecs_t time) {
+    return format("%.2f s", (time - s.facts.startTime) / 1e9);
+}
+
+std::string refreshRate(const Summary& s) {
+    const MeasuredLayer& m = s.measured;
+    if (!m.detectedRefreshRate) return "n/a";
+    return format("%d / %.0f Hz (from %s)", *m.detectedRefreshRate, s.facts.refreshHz,
+                  seconds(s, *m.refreshRateSettled).c_str());
+}
+
+std::string refused(const Summary& s) {
+    const MeasuredLayer& m = s.measured;
+    return format("%.1f per second (%" PRIu64 " refused, %s %%)",
+                  perSecond(m.refreshes - m.refusedPresentations, s.facts.runSec).value_or(0),
+                  m.refusedPresentations, share(m.refusedPresentations, m.refreshes).c_str());
+}
+
+std::string gameRateLimit(const Summary& s) {
+    const MeasuredLayer& m = s.measured;
+    if (!m.lastGameRateLimit) return "none";
+    std::string text = format("%d / %d / %d fps, ", *m.firstGameRateLimit, *m.lastGameRateLimit,
+                              *m.lowestGameRateLimit);
+    if (m.gameRateLimitAppliedFrom)
+        return text + "applied from " + seconds(s, *m.gameRateLimitAppliedFrom);
+    return text + "not applied";
+}
+
+std::string interpolation(const Summary& s) {
+    const MeasuredLayer& m = s.measured;
+    if (m.interpolationOffAt) return "switched off at " + seconds(s, *m.interpolationOffAt);
+    return m.interpolatedAtAll ? "on throughout" : "off";
+}
+
+std::string statistic(const Summary& s, size_t i) {
+    const MeasuredLayer& m = s.measured;
+    if (m.statisticSeconds == 0) return "n/a";
+    const MeasuredLayer::Spread& spread = m.statistics[i];
+    return format("%.1f / %" PRId64 " / %" PRId64, spread.mean, spread.min, spread.max);
+}
+
+template <size_t I>
+std::string statisticAt(const Summary& s) {
+    return statistic(s, I);
+}
+
 struct Line {
     const char* label;
     std::string (*value)(const Summary&);
@@ -117,6 +166,13 @@ const Line LINES[] = {
              return number(perSecond(s.measured.framesShown, s.facts.runSec), "%.1f") +
                     format(" (%" PRIu64 " dropped)", s.measured.framesDropped);
          }},
+        {"refresh rate detected / display", refreshRate},
+        {"render rate (presentations)", refused},
+        {"client compositions",
+         [](const Summary& s) {
+             return format("%" PRIu64 " (%s %%)", s.measured.clientCompositions,
+                           share(s.measured.clientCompositions, s.measured.refreshes).c_str());
+         }},
         {"pictures blend / new / repeat / held",
          [](const Summary& s) {
              const MeasuredLayer& m = s.measured;
@@ -134,6 +190,7 @@ const Line LINES[] = {
          [](const Summary& s) {
              return number(s.facts.ownFps, "%.1f") + " fps" + (throttled(s) ? " (held back)" : "");
          }},
+        {"game-rate limit first / last / lowest", gameRateLimit},
         {"waited for a free buffer",
          [](const Summary& s) {
              return format("%.0f ms (%.1f %% of the run)", s.measured.bufferWaitMs,
@@ -156,11 +213,20 @@ const Line LINES[] = {
          }},
         {"Run", nullptr},
         {"run length", [](const Summary& s) { return format("%.2f s", s.facts.runSec); }},
+        {"interpolation", interpolation},
         {"refreshes",
          [](const Summary& s) {
              return format("%" PRIu64 " (%" PRIu64 " vsyncs skipped)", s.measured.refreshes,
                            s.measured.skippedVsyncs);
          }},
+        {"Library statistics per second: mean / min / max", nullptr},
+        {"game fps (frames queued)", statisticAt<0>},
+        {"real game fps (tracker)", statisticAt<1>},
+        {"actual fps (distinct pictures)", statisticAt<2>},
+        {"interpolated fps", statisticAt<3>},
+        {"missed fps", statisticAt<4>},
+        {"repeated fps", statisticAt<5>},
+        {"skipped fps", statisticAt<6>},
 };
 
 std::string title(const Summary& s) {
@@ -198,6 +264,28 @@ std::string costFinding(const Summary& run, const Summary& reference) {
 }
 
 void warnings(const Summary& s, std::vector<std::string>& out) {
+    const MeasuredLayer& m = s.measured;
+    if (m.interpolationOffAt) {
+        std::string why;
+        for (const WarningRecord& warning : m.warnings) {
+            if (warning.time <= *m.interpolationOffAt) {
+                why = " after " + warningCodeName(warning.code) + " (see the ledger)";
+            }
+        }
+        out.push_back(
+                format("Note: %s: interpolation was switched off at %.2f s%s; the game went "
+                       "on without it.",
+                       s.facts.role.c_str(), (*m.interpolationOffAt - s.facts.startTime) / 1e9,
+                       why.c_str()));
+    }
+    if (m.gameRateLimitApplied && m.lastGameRateLimit && m.lastStatistics) {
+        out.push_back(
+                format("Note: %s: the game was held to the game-rate limit (gfpsOffsetEnabled), "
+                       "which ended at %d fps; the game queued %d frames in the last second, "
+                       "against its own %.1f fps.",
+                       s.facts.role.c_str(), *m.lastGameRateLimit, m.lastStatistics->gameFps,
+                       s.facts.ownFps.value_or(0)));
+    }
     if (throttled(s)) {
         out.push_back(
                 format("Warning: %s: the game was held back to %.1f fps against its own "
@@ -225,7 +313,29 @@ const char* modeName(uint32_t mode) {
 bool throttled(const Summary& summary) {
     const auto& own = summary.facts.ownFps;
     const auto& achieved = summary.measured.gameFps.average;
-    return own && achieved && *achieved < THROTTLE_SHARE * *own;
+    // A game held to its game-rate limit is held back on purpose; its own note says so.
+    return own && achieved && *achieved < THROTTLE_SHARE * *own &&
+           !summary.measured.gameRateLimitAppliedFrom;
+}
+
+std::vector<std::string> ledgerLines(const Summary& run, const Summary* reference) {
+    std::vector<std::pair<nsecs_t, std::string>> lines;
+    uint64_t unlisted = 0;
+    for (const Summary* s : {&run, reference}) {
+        if (s == nullptr) continue;
+        for (const WarningRecord& warning : s->measured.warnings)
+            lines.emplace_back(warning.time,
+                               ledgerLine(warning, run.facts.startTime, s->facts.role));
+        unlisted += s->measured.warningCount - s->measured.warnings.size();
+    }
+    std::stable_sort(lines.begin(), lines.end(),
+                     [](const auto& a, const auto& b) { return a.first < b.first; });
+    std::vector<std::string> out;
+    for (auto& [time, line] : lines)
+        out.push_back(std::move(line));
+    if (unlisted > 0) out.push_back(format("(and %" PRIu64 " more)", unlisted));
+    if (out.empty()) out.push_back("none");
+    return out;
 }
 
 std::vector<SummaryRow> summaryRows(const Summary& run, const Summary* reference) {
@@ -278,6 +388,9 @@ std::string formatSummary(const Summary& run, const Summary* reference) {
             line.pop_back();
         out += line + "\n";
     }
+    out += "Watchdog warnings: time in the run, time of day, game, code, value\n";
+    for (const std::string& line : ledgerLines(run, reference))
+        out += "  " + line + "\n";
     return out;
 }
 

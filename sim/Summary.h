@@ -19,6 +19,7 @@ struct LayerFacts {
     uint64_t bufferBytes = 0;      // all the layer's buffers at the game's resolution
     std::string resolution;        // "1920x1080"
     std::optional<double> ownFps;  // the rate the game runs at on its own
+    double refreshHz = 0;          // the display's true refresh rate
     nsecs_t startTime = 0;         // stutter times count from here
     bool captureEnded = false;     // the run stopped because its capture ran out
 };
@@ -51,7 +52,12 @@ std::vector<std::string> findings(const Summary& run, const Summary* reference);
 // The name of an interpolation mode: "retime" for 0, ... "latency reduction" for 5.
 const char* modeName(uint32_t mode);
 
-// The findings, a blank line, and the table with the reference in a second column.
+// The watchdog warnings of both layers in time order, one line each ("none" when there were none),
+// as the settings client read them back.
+std::vector<std::string> ledgerLines(const Summary& run, const Summary* reference);
+
+// The findings, a blank line, the table with the reference in a second column, and the ledger of
+// watchdog warnings.
 std::string formatSummary(const Summary& run, const Summary* reference = nullptr);
 
 }  // namespace verolux::sim

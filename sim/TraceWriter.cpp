@@ -6,6 +6,8 @@
 #include <cstdarg>
 #include <cstdio>
 
+#include "sim/WarningLedger.h"
+
 namespace verolux::sim {
 
 namespace {
@@ -73,8 +75,13 @@ public:
     const int mPid;
     const nsecs_t mRefreshPeriod;
     uint64_t mNamedSlots = 0;  // bit per slot below 64 already named
+    void onWarning(const WarningRecord& warning) override;
+
     PerSecond mGameFps;
     PerSecond mDisplayedFps;
+    PerSecond mRenderRate;
+    int32_t mRefreshRate = -1;    // last written
+    int32_t mGameRateLimit = -1;  // last written; 0 when not applied
 };
 
 void TraceWriter::LayerTrace::emit(const char* format, ...) {
@@ -115,11 +122,35 @@ void TraceWriter::LayerTrace::onRefresh(const RefreshRecord& refresh) {
         counter("content age", refresh.presentTime, "ms",
                 (static_cast<double>(refresh.presentTime) - refresh.contentTime) / 1e6);
     }
+    if (refresh.refreshRate != mRefreshRate) {
+        mRefreshRate = refresh.refreshRate;
+        counter("detected refresh rate", refresh.vsyncTime, "Hz", mRefreshRate);
+    }
+    const int32_t limit = refresh.gameRateLimitApplied ? refresh.gameRateLimit : 0;
+    if (limit != mGameRateLimit) {
+        mGameRateLimit = limit;
+        counter("game-rate limit", refresh.vsyncTime, "fps", limit);
+    }
+    if (refresh.refused) {
+        emit("{\"ph\":\"i\",\"s\":\"t\",\"name\":\"refused presentation\",\"cat\":\"display\","
+             "\"pid\":%d,\"tid\":%d,\"ts\":%.3f,\"args\":{\"refresh\":%" PRIu64 "}}",
+             mPid, DISPLAY_TID, us(refresh.vsyncTime), refresh.index);
+    } else {
+        mRenderRate.add(refresh.vsyncTime, mWriter.mOrigin, [this](nsecs_t end, uint64_t n) {
+            counter("render rate", end, "fps", static_cast<double>(n));
+        });
+    }
     if (refresh.picture == Picture::BLEND || refresh.picture == Picture::NEW) {
         mDisplayedFps.add(refresh.presentTime, mWriter.mOrigin, [this](nsecs_t end, uint64_t n) {
             counter("displayed fps", end, "fps", static_cast<double>(n));
         });
     }
+}
+
+void TraceWriter::LayerTrace::onWarning(const WarningRecord& warning) {
+    emit("{\"ph\":\"i\",\"s\":\"p\",\"name\":\"watchdog warning\",\"cat\":\"watchdog\","
+         "\"pid\":%d,\"tid\":%d,\"ts\":%.3f,\"args\":{\"code\":\"%s\",\"value\":%g}}",
+         mPid, DISPLAY_TID, us(warning.time), warningCodeName(warning.code).c_str(), warning.value);
 }
 
 void TraceWriter::LayerTrace::onFrame(const FrameRecord& frame) {

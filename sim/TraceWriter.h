@@ -20,8 +20,11 @@ namespace verolux::sim {
 //     each frame ("draw", arg frame);
 //   - track "slot N" per buffer: "frame N" from queue to release, with instants "render done",
 //     "acquire" and "first present";
-//   - counters "queue length" (frames), "display delay" (ms), "content age" (ms), and per second
-//     of the run "game fps" (frames queued) and "displayed fps" (new pictures).
+//   - counters "queue length" (frames), "display delay" (ms), "content age" (ms), "detected refresh
+//     rate" (Hz), "game-rate limit" (fps, 0 while none is applied), and per second of the run
+//     "game fps" (frames queued), "displayed fps" (new pictures) and "render rate" (refreshes the
+//     layer presented at);
+//   - instants "refused presentation" on the display track, and "watchdog warning" (code, value).
 class TraceWriter {
 public:
     TraceWriter(std::ostream& out, nsecs_t origin, const Json::Value& options);

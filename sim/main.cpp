@@ -194,6 +194,17 @@ int main(int argc, char** argv) {
         }
     };
     check(outputs.finish());
+    {
+        std::ofstream file(out / "dumpsys.txt");
+        file << result.dump;
+        if (!file) check(Status{errorLine("cannot write " + (out / "dumpsys.txt").string())});
+    }
+    {
+        std::ofstream file(out / "ringlog.bin", std::ios::binary);
+        file.write(reinterpret_cast<const char*>(result.ringLogs.data()),
+                   static_cast<std::streamsize>(result.ringLogs.size()));
+        if (!file) check(Status{errorLine("cannot write " + (out / "ringlog.bin").string())});
+    }
 
     std::vector<Summary> summaries;
     for (size_t i = 0; i < simulation.layers().size(); i++) {
@@ -210,6 +221,7 @@ int main(int argc, char** argv) {
                 std::to_string(options.gameWidth) + "x" + std::to_string(options.gameHeight);
         const MeasuredLayer measured = outputs.measures(i).result();
         facts.ownFps = capture ? capture->fpsOverFirst(measured.framesQueued) : options.fps;
+        facts.refreshHz = options.hz;
         facts.startTime = simulation.startTime();
         facts.captureEnded = result.captureEnded;
         summaries.push_back({facts, measured});
@@ -238,6 +250,8 @@ int main(int argc, char** argv) {
               << "  presentmon.csv  the frames in PresentMon's columns"
               << (reference != nullptr ? " (reference-*.csv: mode 2)" : "") << "\n"
               << "  trace.json      open in https://ui.perfetto.dev\n"
+              << "  dumpsys.txt     each layer's dump at the end of the run\n"
+              << "  ringlog.bin     each layer's event ring log (verolux-ringlog reads it)\n"
               << "  *.png           the figures\n"
               << "  engine.log      " << engineLog.lines()
               << (engineLog.lines() == 1 ? " line" : " lines") << " from the library (logLevel "

@@ -114,11 +114,10 @@ TEST_P(LayerHostTest, tearDownEndsTheReleaseThreadWhateverItWaitsForAndWhateverT
              systemTime(SYSTEM_TIME_MONOTONIC) < end;) {
             queueFrame(random() % 4 != 0, random() % 3 != 0);
             const nsecs_t displayTime = systemTime(SYSTEM_TIME_MONOTONIC) - random() % 2'000'000;
-            const RenderState state = host->compose(displayTime);
-            host->onCompositionDone(state, displayTime, FenceTime::NO_FENCE);
+            host->onCompositionDone(host->compose(displayTime), displayTime, FenceTime::NO_FENCE);
             std::this_thread::sleep_for(std::chrono::microseconds(random() % 300));
         }
-        const RenderState held = host->compose(systemTime(SYSTEM_TIME_MONOTONIC));
+        host->compose(systemTime(SYSTEM_TIME_MONOTONIC));
         queueFrame(true, true);
         const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
         EventDispatcher::broadcastEvent(mUid, eCompositionEstimateEvent, now, now + 10'000'000'000);

@@ -46,6 +46,10 @@ TEST(CsvTest, framesRefreshesAndPresentMonRowsHaveTheirColumns) {
     r.items[r.itemCount++] = {8, 0.25f, 0.25f};
     r.delay = 64 * MS;
     r.cpuTime = 35'000;
+    r.clientComposed = true;
+    r.refreshRate = 120;
+    r.gameRateLimit = 45;
+    r.gameRateLimitApplied = true;
     RefreshesCsv(refreshes, 0).onRefresh(r);
 
     EXPECT_EQ(
@@ -55,8 +59,8 @@ TEST(CsvTest, framesRefreshesAndPresentMonRowsHaveTheirColumns) {
             frames.str());
     EXPECT_EQ(
             "refresh,vsync_ns,present_ns,picture,frame0,alpha0,frame1,alpha1,content_ns,"
-            "delay_ns,cpu_ns\n"
-            "3,24999999,33333332,blend,7,1,8,0.25,20001000,64000000,35000\n",
+            "delay_ns,cpu_ns,refused,client,refresh_hz,game_limit_fps\n"
+            "3,24999999,33333332,blend,7,1,8,0.25,20001000,64000000,35000,0,1,120,45\n",
             refreshes.str());
     EXPECT_EQ(
             "Application,ProcessID,SwapChainAddress,Runtime,SyncInterval,PresentFlags,Dropped,"
@@ -77,7 +81,17 @@ TEST(TraceTest, streamsAValidTraceWithPictureSlicesCountersAndOptions) {
         RefreshRecord r = refreshAt(0, HZ120, Picture::BLEND, 1 * MS);
         r.items[r.itemCount++] = {3, 1.0f, 0.5f};
         r.items[r.itemCount++] = {4, 0.5f, 0.5f};
+        r.refreshRate = 120;
+        r.gameRateLimit = 45;
+        r.gameRateLimitApplied = true;
         layer.onRefresh(r);
+        RefreshRecord refused = refreshAt(1, HZ120, Picture::HELD, 1 * MS);
+        refused.refused = true;
+        refused.refreshRate = 120;
+        refused.gameRateLimit = 45;
+        refused.gameRateLimitApplied = true;
+        layer.onRefresh(refused);
+        layer.onWarning({5 * MS, 0, 0, false, 29});
         layer.onDelayChange(0, 64 * MS);
         FrameRecord f;
         f.number = 3;
@@ -101,9 +115,12 @@ TEST(TraceTest, streamsAValidTraceWithPictureSlicesCountersAndOptions) {
             EXPECT_NEAR(8333.333, e["ts"].asDouble(), 0.001);  // at the present, in us
         }
     }
-    EXPECT_THAT(names, testing::ElementsAre("X blend", "C queue length", "C content age",
-                                            "C display delay", "X wait for buffer", "X draw",
-                                            "X frame 3"));
+    EXPECT_THAT(names,
+                testing::ElementsAre("X blend", "C queue length", "C content age",
+                                     "C detected refresh rate", "C game-rate limit", "X held",
+                                     "C queue length", "C content age", "i refused presentation",
+                                     "i watchdog warning", "C display delay", "X wait for buffer",
+                                     "X draw", "X frame 3"));
 }
 
 TEST(SpaceTimeWindowTest, keepsTheWindowOrTheLastStretchOfAShorterRun) {
