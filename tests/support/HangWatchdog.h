@@ -4,7 +4,6 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <cstdio>
 #include <cstdlib>
 #include <future>
 #include <string>
@@ -16,18 +15,15 @@ namespace android::test {
 // prints every thread's stack (through gdb) and aborts: a hang fails at once and shows where each
 // thread waits, instead of running into the suite's timeout.
 template <typename Section>
-std::chrono::nanoseconds runWithin(std::chrono::milliseconds limit, const char* what,
-                                   Section&& section) {
+std::chrono::nanoseconds runWithin(std::chrono::milliseconds limit, Section&& section) {
     std::promise<void> done;
     std::thread watchdog([&, finished = done.get_future()] {
         if (finished.wait_for(limit) == std::future_status::ready) return;
-        fprintf(stderr, "%s took longer than %lld ms; the threads' stacks:\n", what,
-                static_cast<long long>(limit.count()));
         // A restricted ptrace scope lets gdb attach from a child only with this permission.
         prctl(PR_SET_PTRACER, PR_SET_PTRACER_ANY, 0, 0, 0);
-        const std::string gdb =
-                "gdb -p " + std::to_string(getpid()) + " -batch -nx -ex 'thread apply all bt' 1>&2";
-        if (std::system(gdb.c_str()) != 0) fprintf(stderr, "(gdb failed)\n");
+        const std::string gdb = "gdb -batch -nx -ex 'thread apply all bt' -p ";
+        std::system(
+                ("echo Hung, the threads: >&2; " + gdb + std::to_string(getpid()) + " >&2").c_str());
         std::abort();
     });
     const auto start = std::chrono::steady_clock::now();
