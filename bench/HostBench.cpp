@@ -11,8 +11,6 @@
 #include <thread>
 #include <vector>
 
-#include "JustInTimeReleasePicker.h"
-#include "Settings.h"
 #include "host/LayerHost.h"
 
 namespace android::Interpolation {
@@ -177,8 +175,8 @@ void BM_HostCompositionCpuFloor(benchmark::State& state) {
 }
 BENCHMARK(BM_HostCompositionCpuFloor)->UseManualTime()->Iterations(240);
 
-// Runs the benchmark's loop on a thread set up as the host's release thread, and puts the
-// benchmark thread back as it was afterwards.
+// Sets the benchmark thread up as the host's release thread, and puts it back as it was
+// afterwards.
 class ReleaseThreadSetup {
 public:
     ReleaseThreadSetup()
@@ -199,40 +197,52 @@ private:
 constexpr nsecs_t COMPOSITION_AHEAD = 5 * MS;
 constexpr int32_t MARGIN_MS = 2;
 
-// How late the just-in-time picker's selection returns after the margin before the next
-// composition, on a thread set up as the host's release thread. The reported time per iteration
-// is that lateness, not the wait.
+// How late the host's release thread lets a frame go after the just-in-time margin before the next
+// composition: the time the frame leaves the queue, less the composition estimate and the margin.
+// Each iteration announces a composition ahead and queues and acquires a third frame, which the
+// layer's picker (the frame not on screen yet) lets go the margin before that composition. The
+// reported time per iteration is that lateness.
 void BM_JustInTimeReleaseLateness(benchmark::State& state) {
-    const uint32_t uid = 4253;
-    String8 name("SurfaceView[bench]");
-    sp<FrameList> list = new FrameList(uid);
-    sp<JustInTimeReleasePicker> picker = new JustInTimeReleasePicker(list, name, uid);
-    Settings settings;
-    settings.justInTimeMarginMs = MARGIN_MS;
-    picker->onSettingsChanged(settings);
+    constexpr int32_t JUST_IN_TIME_MARGIN_ID = 22;
+    LayerHost::Config config;
+    config.name = String8("SurfaceView[bench]");
+    config.uid = 4253;
+    config.mode = eJustInTimeMode;
+    std::atomic<nsecs_t> released{0};
+    LayerHost host(config, [&](const FrameItem&) { released = systemTime(SYSTEM_TIME_MONOTONIC); });
+    verolux::host::deliverSettings(config.uid, {{JUST_IN_TIME_MARGIN_ID, MARGIN_MS}});
+    host.start();
     const sp<GraphicBuffer> buffer = new GraphicBuffer(1, 1, PIXEL_FORMAT_RGBA_8888);
-    for (int i = 1; i <= 3; i++) {
-        FrameItem frame;
-        frame.mIndex = static_cast<uint64_t>(i);
-        frame.mTextureSlot = i;
-        frame.mGraphicBuffer = buffer;
-        frame.mID = frame.mTimestamp = i * FRAME_PERIOD;
-        frame.mAcquireFence = Fence::NO_FENCE;
-        frame.mAcquired = true;
-        list->insertFrame(frame);
-    }
+    uint64_t number = 0;
+    const auto queueFrame = [&] {
+        const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
+        const sp<Fence> fence = Fence::createSignalled(now);
+        number++;
+        host.onBufferQueued(number, static_cast<int>(number % BUFFERS), buffer, now, fence);
+        host.onBufferAcquired(number, static_cast<int>(number % BUFFERS), buffer, now, fence);
+    };
+    queueFrame();
+    queueFrame();
 
-    ReleaseThreadSetup releaseThread;
     std::vector<nsecs_t> samples;
     for (auto _ : state) {
+        // Announced before the frame comes, so that no step sees the frame with the previous
+        // composition, and again once it is acquired, which by itself wakes nobody.
+        const nsecs_t releasedBefore = released;
         const nsecs_t composition = systemTime(SYSTEM_TIME_MONOTONIC) + COMPOSITION_AHEAD;
-        picker->onEvent(eCompositionEstimateEvent, 0, composition);
-        benchmark::DoNotOptimize(picker->selectFrameForRelease());
-        const nsecs_t lateness = systemTime(SYSTEM_TIME_MONOTONIC) - (composition - MARGIN_MS * MS);
+        const nsecs_t target = composition - MARGIN_MS * MS;
+        EventDispatcher::broadcastEvent(config.uid, eCompositionEstimateEvent, 0, composition);
+        queueFrame();
+        EventDispatcher::broadcastEvent(config.uid, eCompositionEstimateEvent, 0, composition);
+        sleepUntil(target + MS);
+        while (released == releasedBefore)
+            sleepUntil(systemTime(SYSTEM_TIME_MONOTONIC) + 100'000);
+        const nsecs_t lateness = released - target;
         samples.push_back(lateness);
         state.SetIterationTime(static_cast<double>(lateness) / 1e9);
     }
     reportPercentiles(state, samples);
+    host.stop();
 }
 BENCHMARK(BM_JustInTimeReleaseLateness)->UseManualTime()->Iterations(300);
 
