@@ -223,10 +223,14 @@ void LayerHost::onCompositionDone(const RenderState& state, nsecs_t displayTime,
                                   const std::shared_ptr<android::FenceTime>& presentFence,
                                   CompositionType type) {
     for (const RenderItem& item : state.items) {
-        if (item.frame.isEmpty()) continue;
-        mTimings->presentFenceTimings(presentFence, item.frame.mTextureSlot);
-        mFrameList->unlock(item.frame.mID);
+        if (!item.frame.isEmpty())
+            mTimings->presentFenceTimings(presentFence, item.frame.mTextureSlot);
     }
+    // Every lock the composition took goes, not only those of the composed items: a builder may
+    // lock a frame it looked at but did not compose (the unlimited builder's unready newest frame,
+    // the mirror's frame at the display time), and such a lock would otherwise hold that frame's
+    // removal, and so its buffer, until tear-down.
+    mFrameList->unlockAll();
     clearUnusedFrames(displayTime);
     recordReleases();
 

@@ -4,12 +4,14 @@
 #include <algorithm>
 #include <chrono>
 #include <cstdio>
+#include <future>
 #include <limits>
 #include <mutex>
 #include <random>
 #include <set>
 #include <thread>
 
+#include "SettingsController.h"
 #include "host/BufferCount.h"
 #include "host/LayerHost.h"
 #include "support/Frames.h"
@@ -86,6 +88,30 @@ TEST_P(LayerHostTest, aFrameAcquiredAfterItLeftTheQueueDoesNotComeBack) {
     EXPECT_EQ(0u, host->frameList()->size());
     host->stop();
     EXPECT_THAT(returned(), testing::ElementsAre(1u));
+}
+
+TEST_P(LayerHostTest, aCompositionLeavesNoFrameLockedOnceDone) {
+    // Some builders lock a frame they look at without composing it (the unlimited builder's
+    // unready newest frame): the frames must still leave the queue once the composition is done.
+    deliverSettings(mUid, {{0, 60}});  // gameFpsLimit: the engine composes, not the host
+    std::unique_ptr<LayerHost> host = makeHost();
+    SettingsController::getInstance()->notifyChanges();
+    queueFrames(*host, 2);
+    const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
+    const sp<GraphicBuffer> buffer = new GraphicBuffer(1, 1, PIXEL_FORMAT_RGBA_8888);
+    host->onBufferQueued(3, 3, buffer, now + 30'000'000, Fence::createPending());
+    const RenderState state = host->compose(now + 30'000'000);
+    host->onCompositionDone(state, now + 30'000'000, nullptr);
+
+    auto removals = std::async(std::launch::async, [&] {
+        while (host->frameList()->size() > 0)
+            host->frameList()->clearOldestFrameLocking();
+    });
+    const bool done = removals.wait_for(1s) == std::future_status::ready;
+    host->frameList()->killLocks();  // ends a removal that a leaked lock holds
+    EXPECT_TRUE(done);
+    removals.wait();
+    host->stop();
 }
 
 TEST_P(LayerHostTest, tearDownEndsTheReleaseThreadWhateverItWaitsForAndWhateverTheMargin) {
