@@ -6,6 +6,7 @@
 #include <cstring>
 #include <fstream>
 #include <map>
+#include <sstream>
 
 #include "sim/TextNumbers.h"
 
@@ -290,6 +291,11 @@ Result<Capture> parseCapture(std::istream& in, const std::string& name, size_t m
     R result;
     if (std::string error = parser.finish(result.value); !error.empty()) return R::failure(error);
     return result;
+}
+
+Result<Capture> parseCapture(std::string_view text, const std::string& name, size_t maxFrames) {
+    std::istringstream in{std::string(text)};
+    return parseCapture(in, name, maxFrames);
 }
 
 Result<Capture> readCapture(const std::string& path) {

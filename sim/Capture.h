@@ -6,6 +6,7 @@
 #include <istream>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "sim/Result.h"
@@ -56,6 +57,9 @@ struct Capture {
 
 // name stands for the input in error lines ("name:7: queue_ns is not a number").
 Result<Capture> parseCapture(std::istream& in, const std::string& name,
+                             size_t maxFrames = MAX_CAPTURE_FRAMES);
+// The same, from a capture's whole text in memory.
+Result<Capture> parseCapture(std::string_view text, const std::string& name,
                              size_t maxFrames = MAX_CAPTURE_FRAMES);
 Result<Capture> readCapture(const std::string& path);
 

@@ -1,16 +1,13 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <sstream>
-
 #include "sim/Capture.h"
 
 namespace verolux::sim {
 namespace {
 
 Result<Capture> parse(const std::string& text, size_t maxFrames = MAX_CAPTURE_FRAMES) {
-    std::istringstream in(text);
-    return parseCapture(in, "capture.csv", maxFrames);
+    return parseCapture(std::string_view(text), "capture.csv", maxFrames);
 }
 
 std::vector<std::pair<nsecs_t, nsecs_t>> times(const Result<Capture>& capture) {
