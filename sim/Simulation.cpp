@@ -64,7 +64,7 @@ void readWarnings(uint32_t uid, nsecs_t startTime, int64_t startWallMs, LayerRec
     parcel.setDataPosition(0);
     DecodedWarnings decoded = decodeWarnings(parcel);
     for (WarningRecord& warning : decoded.warnings) {
-        warning.time = startTime + (warning.wallMs - startWallMs) * MS;
+        warning.time = warningRunTime(warning.wallMs, startTime, startWallMs);
         recorder.warning(warning);
     }
     if (!decoded.error.empty()) {
