@@ -247,7 +247,8 @@ std::string CaptureParser::finish(Capture& capture) {
 
 nsecs_t Capture::meanInterval() const {
     if (frames.size() < 2 || span() <= 0) return 1'000'000'000;
-    return span() / static_cast<nsecs_t>(frames.size() - 1);
+    // Frames closer than a nanosecond apart on average still give a finite rate.
+    return std::max<nsecs_t>(1, span() / static_cast<nsecs_t>(frames.size() - 1));
 }
 
 double Capture::fpsOverFirst(size_t count) const {

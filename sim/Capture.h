@@ -45,7 +45,8 @@ struct Capture {
     // Shifted so that the first frame is queued at 0.
     std::vector<CaptureFrame> frames;
 
-    // The mean interval between frames (the span over the intervals; 1 s for a single frame).
+    // The mean interval between frames (the span over the intervals, at least 1 ns; 1 s for a
+    // single frame).
     nsecs_t meanInterval() const;
     // The rate the game ran at: 1 / the mean interval.
     double fps() const { return 1e9 / static_cast<double>(meanInterval()); }

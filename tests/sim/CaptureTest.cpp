@@ -90,6 +90,8 @@ TEST(CaptureTest, theShippedCaptureIsValid) {
     // The pace asked of a run that replayed the first 61 frames: 60 intervals of 33.3 ms.
     EXPECT_NEAR(30.0, capture.value.fpsOverFirst(61), 0.2);
     EXPECT_NEAR(1e9 / capture.value.meanInterval(), capture.value.fpsOverFirst(1000), 1e-9);
+    // Three intervals over 1 ns once made a mean of 0 and an infinite rate.
+    EXPECT_EQ(1, parse("queue_ns\n0\n0\n0\n1\n").value.meanInterval());
 }
 
 }  // namespace
