@@ -44,8 +44,8 @@ LayerHost::LayerHost(Config config, FrameReleasedCallback onFrameReleased)
       mDeadlinePredictor(new MachineLearning::CompositionDeadlinePredictor(mConfig.uid)),
       mOnFrameReleased(std::move(onFrameReleased)),
       mSettings(new LayerSettings(mConfig.uid)),
-      mRates(mConfig.name, mConfig.uid),
-      mMonitor(mConfig.name, mConfig.uid, mConfig.mode, mRealFps) {
+      mMonitor(mConfig.name, mConfig.uid, mConfig.mode, mRealFps),
+      mRates(mConfig.name, mConfig.uid) {
     String8 name = mConfig.name;
     sp<android::FrameList> frameList = mFrameList;
     sp<FrameTimingsAggregator> timings = mTimings;
@@ -140,6 +140,10 @@ void LayerHost::onBufferDequeued(int slot, nsecs_t requestTime, nsecs_t dequeueT
     mTimings->dequeueTimings(dequeueTime, slot);
 }
 
+void LayerHost::onBufferBackpressure() {
+    mMonitor.onBackpressure();
+}
+
 void LayerHost::onBufferQueued(uint64_t frameNumber, int slot,
                                const sp<android::GraphicBuffer>& buffer, nsecs_t timestamp,
                                const sp<android::Fence>& acquireFence) {
@@ -153,6 +157,7 @@ void LayerHost::onBufferQueued(uint64_t frameNumber, int slot,
     mRealFps->logBufferProvided(now);
     mMonitor.onGameFrame(now);
     mRates.onRealFps(mRealFps->getRealFPS(now));
+    mMonitor.onGameRateLimit(mRates.gameRateLimit());
 }
 
 void LayerHost::onBufferAcquired(uint64_t frameNumber, int slot,
@@ -266,6 +271,10 @@ void LayerHost::dump(String8& out) const {
     SettingsController* controller = SettingsController::getInstance();
     std::lock_guard lock(controller->getMutex());
     out.appendFormat("  Settings: %s\n", controller->getSettingsLocked(mConfig.uid).dump().c_str());
+}
+
+void LayerHost::writeRingLog(android::Parcel& out) const {
+    mMonitor.writeRingLog(out);
 }
 
 bool deliverSettings(uint32_t uid, const std::vector<SettingValue>& values) {

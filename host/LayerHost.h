@@ -76,6 +76,8 @@ public:
     // go (a release picker may release a queued frame while the queue is acquiring it) is ignored,
     // so that the frame does not come back into the engine's queue.
     void onBufferDequeued(int slot, nsecs_t requestTime, nsecs_t dequeueTime);
+    // The producer found no free buffer and waits for one.
+    void onBufferBackpressure();
     void onBufferQueued(uint64_t frameNumber, int slot,
                         const android::sp<android::GraphicBuffer>& buffer, nsecs_t timestamp,
                         const android::sp<android::Fence>& acquireFence);
@@ -99,6 +101,8 @@ public:
     // The layer in the platform's dumpsys style: the frame list, the delay, the statistics line,
     // the version block and the settings line.
     void dump(android::String8& out) const;
+    // The layer's event ring log, as the controlling service reads it.
+    void writeRingLog(android::Parcel& out) const;
 
     const Config& config() const { return mConfig; }
     const android::sp<android::FrameList>& frameList() const { return mFrameList; }
@@ -132,8 +136,9 @@ private:
     const FrameReleasedCallback mOnFrameReleased;
     android::sp<ReleaseListener> mReleaseListener;
     const android::sp<LayerSettings> mSettings;
-    LayerRates mRates;
+    // Before the rates, so that the ring log hears the render-rate agent's first announcement.
     LayerMonitor mMonitor;
+    LayerRates mRates;
 
     // The composition thread's own.
     android::Interpolation::RenderState mState;  // reused, so that latching allocates nothing

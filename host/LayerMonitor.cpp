@@ -14,7 +14,11 @@ LayerMonitor::LayerMonitor(const String8& name, uint32_t uid, InterpolationMode 
                            const sp<MachineLearning::RealFPSTracker>& realFps)
     : mAggregator(new EventAggregator()),
       mLogOutput(new LogOutput(mAggregator, realFps)),
-      mClientWatchdog(new ClientCompositionWatchdog(uid, name)) {
+      mClientWatchdog(new ClientCompositionWatchdog(uid, name)),
+      mRinglog([&] {
+          String8 ringName = name;
+          return new Ringlog(ringName, mode, uid);
+      }()) {
     sp<RealWatchdogInterface> source = new RealWatchdogInterface(mAggregator);
     mPerformanceWatchdog = new PerformanceWatchdog<RealWatchdogInterface>(uid, name, source);
     if (mode == eLatencyReductionMode) {
@@ -27,9 +31,22 @@ void LayerMonitor::onGameFrame(nsecs_t queueTime) {
     mAggregator->record(Counter::eGameFrames, queueTime);
 }
 
+void LayerMonitor::onBackpressure() {
+    mRinglog->logBackpressure();
+}
+
+void LayerMonitor::onGameRateLimit(int32_t limit) {
+    if (mLoggedGameRateLimit.exchange(limit, std::memory_order_relaxed) != limit) {
+        mRinglog->logGFPSChangedEvent(limit);
+    }
+}
+
 void LayerMonitor::afterComposition(const RefreshClassifier::Outcome& outcome, bool clientComposed,
                                     nsecs_t displayTime) {
     if (outcome.counted) mAggregator->record(outcome.counter, displayTime);
+    if (outcome.counted && outcome.counter == Counter::eRepeatedFrames) {
+        mRinglog->logFrameRepeated();
+    }
     // More than a ring's worth adds nothing to a count of the last second.
     const uint64_t skipped =
             std::min<uint64_t>(outcome.skippedFrames, EventAggregator::RING_CAPACITY);
@@ -60,6 +77,10 @@ FrameRateStatistics LayerMonitor::statistics(nsecs_t now, uint32_t realFps) cons
     s.repeatedFps = mAggregator->count(Counter::eRepeatedFrames, now);
     s.skippedFps = mAggregator->count(Counter::eSkippedFrames, now);
     return s;
+}
+
+void LayerMonitor::writeRingLog(android::Parcel& out) const {
+    mRinglog->writeToParcel(out);
 }
 
 void LayerMonitor::dump(String8& out, const char* prefix) const {

@@ -3,6 +3,7 @@
 #include <utils/String8.h>
 #include <utils/Timers.h>
 
+#include <atomic>
 #include <cstdint>
 
 #include "ClientCompositionWatchdog.h"
@@ -11,6 +12,7 @@
 #include "LogOutput.h"
 #include "PerformanceWatchdog.h"
 #include "RealFPSTracker.h"
+#include "Ringlog.h"
 #include "Timer.h"
 #include "host/FrameRateStatistics.h"
 #include "host/RefreshClassifier.h"
@@ -22,6 +24,9 @@ namespace verolux::host {
 // composition. A watchdog that switches the game off only stores the uid's reset settings; as the
 // platform's settings service, the monitor then delivers them (notifyChanges) at most a second
 // later, from the composition thread with no lock of the layer held.
+//
+// The layer's ring log records every event of its uid by itself; the monitor adds what only the
+// host sees: a picture shown again, a producer that found no free buffer, a new game-rate limit.
 //
 // The latency-reduction watchdog judges a game's steadiness for latency reduction alone, so only
 // a layer in that mode has one.
@@ -37,6 +42,10 @@ public:
 
     // Buffer thread: the game queued a frame.
     void onGameFrame(nsecs_t queueTime);
+    // Buffer thread: the game found no free buffer and had to wait for one.
+    void onBackpressure();
+    // Any thread: the game-rate agent set a limit other than the last one logged.
+    void onGameRateLimit(int32_t limit);
     // Composition thread, after every composition: what the refresh showed, whether it fell back
     // to client composition, and its display time.
     void afterComposition(const RefreshClassifier::Outcome& outcome, bool clientComposed,
@@ -45,6 +54,8 @@ public:
     FrameRateStatistics statistics(nsecs_t now, uint32_t realFps) const;
     // The statistics line and the version block.
     void dump(android::String8& out, const char* prefix) const;
+    // The ring log as the controlling service reads it.
+    void writeRingLog(android::Parcel& out) const;
 
 private:
     using Counter = android::Interpolation::EventAggregator::Counter;
@@ -56,6 +67,8 @@ private:
             mPerformanceWatchdog;
     android::sp<android::Interpolation::LatencyReductionWatchdog> mLatencyWatchdog;  // may be null
     const android::sp<android::Interpolation::ClientCompositionWatchdog> mClientWatchdog;
+    const android::sp<android::Interpolation::Ringlog> mRinglog;
+    std::atomic<int32_t> mLoggedGameRateLimit{0};
     android::Interpolation::Timer mSettingsDelivery;  // composition thread only
 };
 

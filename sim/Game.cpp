@@ -97,7 +97,7 @@ void Game::run(nsecs_t startTime) {
         if (!sleepUntil(frameStart)) return;
 
         const nsecs_t requestTime = systemTime(SYSTEM_TIME_MONOTONIC);
-        const int slot = mQueue.dequeue();
+        const int slot = mQueue.dequeue([this] { mHost.onBufferBackpressure(); });
         if (slot < 0) return;
         const nsecs_t dequeueTime = systemTime(SYSTEM_TIME_MONOTONIC);
         // A game that had to wait for a buffer simulates its world from when it got one.

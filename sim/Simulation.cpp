@@ -7,6 +7,8 @@
 #include <memory>
 #include <thread>
 
+#include <binder/Parcel.h>
+
 #include "SettingsController.h"
 #include "Tunables.h"
 #include "WatchdogWarningController.h"
@@ -195,6 +197,10 @@ RunResult Simulation::run(const std::vector<RecordSink*>& sinks,
         android::String8 dump;
         layer->layerHost->dump(dump);
         result.dump += std::string(dump.c_str()) + "\n";
+        android::Parcel ringLog;
+        layer->layerHost->writeRingLog(ringLog);
+        result.ringLogs.insert(result.ringLogs.end(), ringLog.data(),
+                               ringLog.data() + ringLog.dataSize());
     }
     for (auto& layer : layers)
         layer->layerHost->stop();

@@ -28,6 +28,8 @@ struct RunResult {
     bool interrupted = false;
     bool captureEnded = false;
     std::string dump;  // every layer's dump at the end of the run, before tear-down
+    // Every layer's ring log as its parcel carries it, one after the other, read at the same time.
+    std::vector<uint8_t> ringLogs;
 };
 
 // One run of verolux-sim in real time: the game and, unless left out, the same game (same seed

@@ -204,6 +204,12 @@ int main(int argc, char** argv) {
         file << result.dump;
         if (!file) check(Status{errorLine("cannot write " + (out / "dumpsys.txt").string())});
     }
+    {
+        std::ofstream file(out / "ringlog.bin", std::ios::binary);
+        file.write(reinterpret_cast<const char*>(result.ringLogs.data()),
+                   static_cast<std::streamsize>(result.ringLogs.size()));
+        if (!file) check(Status{errorLine("cannot write " + (out / "ringlog.bin").string())});
+    }
 
     std::vector<Summary> summaries;
     for (size_t i = 0; i < simulation.layers().size(); i++) {
@@ -252,6 +258,7 @@ int main(int argc, char** argv) {
               << (reference != nullptr ? " (reference-*.csv: mode 2)" : "") << "\n"
               << "  trace.json      open in https://ui.perfetto.dev\n"
               << "  dumpsys.txt     each layer's dump at the end of the run\n"
+              << "  ringlog.bin     each layer's event ring log (verolux-ringlog reads it)\n"
               << "  *.png           the figures\n"
               << "  engine.log      " << engineLog.lines()
               << (engineLog.lines() == 1 ? " line" : " lines") << " from the library (logLevel "

@@ -4,6 +4,7 @@
 #include <memory>
 #include <optional>
 
+#include "Ringlog.h"
 #include "SettingsController.h"
 #include "WatchdogWarningController.h"
 #include "host/LayerHost.h"
@@ -11,6 +12,7 @@
 #include "sim/WarningLedger.h"
 #include "support/Frames.h"
 #include "support/TestClock.h"
+#include "tools/ringlog/RinglogReader.h"
 
 namespace verolux::host {
 namespace {
@@ -182,6 +184,39 @@ TEST(LayerSwitchOffTest, aLowRateWarningReachesTheLedgerAndTheHostLatchesFramesI
     EXPECT_NE(std::string::npos, text.find("  Version: 1.5\n")) << text;
     EXPECT_NE(std::string::npos, text.find("interpolation off")) << text;
     EXPECT_NE(std::string::npos, text.find("  Settings: { 0, 64, true,")) << text;
+}
+
+TEST(LayerRingLogTest, recordsWhatOnlyTheHostSeesBesideTheBusEvents) {
+    test::TestClock clock(1000 * SECOND);
+    const uint32_t uid = test::nextTestUid();
+    WiredHost wired(uid, eNoInterpMode);
+    wired.queueFrame(clock);                         // and the game-rate agent's first limit
+    for (int refresh = 0; refresh < 2; refresh++) {  // the frame, then the same picture again
+        clock.advance(SECOND / 60);
+        wired.refresh(clock);
+    }
+    wired.host().onBufferBackpressure();
+
+    Parcel parcel;
+    wired.host().writeRingLog(parcel);
+    const ringlog::RinglogFile file = ringlog::parseRinglog(parcel.data(), parcel.dataSize());
+    ASSERT_TRUE(file.ok()) << file.error;
+    ASSERT_EQ(1u, file.dumps.size());
+    EXPECT_EQ(uid, file.dumps[0].header.uid);
+    std::vector<uint32_t> direct;
+    bool busEventsToo = false;
+    for (const SerializableEvent& record : file.dumps[0].records) {
+        if (record.type == Ringlog::FRAME_REPEATED_RECORD ||
+            record.type == Ringlog::BACKPRESSURE_RECORD ||
+            record.type == Ringlog::GFPS_CHANGED_RECORD) {
+            direct.push_back(record.type);
+        }
+        busEventsToo |= record.type == eFrameReceivedEvent;
+    }
+    EXPECT_TRUE(busEventsToo);
+    EXPECT_EQ((std::vector<uint32_t>{Ringlog::GFPS_CHANGED_RECORD, Ringlog::FRAME_REPEATED_RECORD,
+                                     Ringlog::BACKPRESSURE_RECORD}),
+              direct);
 }
 
 TEST(WarningLedgerTest, decodesEachRecordByItsCodeAndStopsAtABrokenOne) {
