@@ -44,8 +44,10 @@ TEST_P(SimulationTest, showsAPictureAtEveryRefreshAndHandsEveryBufferBack) {
     const RunResult result = simulation.run({&sink}, false, nullptr);
     EXPECT_LT(steady_clock::now() - start, 1500ms);  // tear-down included
     EXPECT_FALSE(result.interrupted);
-    ASSERT_GE(sink.refreshes.size(), 40u);  // 48 at 60 Hz, less what a busy machine drops
-    ASSERT_GE(sink.frames.size(), 15u);
+    // 48 refreshes at 60 Hz and 24 frames at 30 fps, less what a busy machine or a sanitizer
+    // build drops (a third of the refreshes under AddressSanitizer on two shared cores).
+    ASSERT_GE(sink.refreshes.size(), 24u);
+    ASSERT_GE(sink.frames.size(), 12u);
     // Once the game's first frame is on screen, the layer always shows a picture.
     for (const RefreshRecord& refresh : sink.refreshes)
         EXPECT_TRUE(refresh.presentTime < simulation.startTime() + 150'000'000 ||
