@@ -18,6 +18,17 @@ using android::sp;
 using android::String8;
 using namespace android::Interpolation;
 
+namespace {
+
+// `wait` after `now` (a time of the monotonic clock), at most the largest time: a policy's wait is
+// bounded, though not tightly.
+nsecs_t timeAfter(nsecs_t now, nsecs_t wait) {
+    constexpr nsecs_t LATEST = std::numeric_limits<nsecs_t>::max();
+    return wait >= LATEST - now ? LATEST : now + wait;
+}
+
+}  // namespace
+
 // Hands every frame that leaves the list back to the host's owner.
 class LayerHost::ReleaseListener : public EventDispatcher::EventReceiver {
 public:
@@ -112,12 +123,7 @@ void LayerHost::releaseLoop(sp<ReleasePicker> picker) {
         const FrameItem frame = picker->selectFrameForRelease();
         recordReleases();
         if (frame.mIndex != NO_FRAME) {
-            setLeavingFrame(frame.mIndex);
-            mFrameList->clearFrameAtLocking(frame.mID);
-            setLeavingFrame(NO_FRAME);
-            // At once, while this thread still holds the frame: the timings let go of its fence
-            // here, not on the composition thread.
-            recordReleases();
+            releaseFrame(frame);
             continue;
         }
         // Nothing to release. Some policies say so at once (an empty queue), so ask again only
@@ -126,6 +132,60 @@ void LayerHost::releaseLoop(sp<ReleasePicker> picker) {
         mQueueChanged.wait_for(lock, std::chrono::nanoseconds(ReleasePicker::EVENT_WAIT_TIMEOUT),
                                [&] { return mQueueChanges != changesBefore || !mRunning; });
     }
+}
+
+void LayerHost::releaseFrame(const FrameItem& frame) {
+    setLeavingFrame(frame.mIndex);
+    mFrameList->clearFrameAtLocking(frame.mID);
+    setLeavingFrame(NO_FRAME);
+    // At once, while this thread still holds the frame: the timings let go of its fence here, not
+    // on the composition thread.
+    recordReleases();
+}
+
+LayerHost::ReleaseStep LayerHost::stepRelease() {
+    using Next = ReleaseStep::Next;
+    if (mPicker == nullptr) return {Next::WAIT_FOR_EVENT, std::numeric_limits<nsecs_t>::max()};
+    const uint64_t eventsBefore = releaseEvents();
+    const ReleaseChoice choice = mPicker->decideRelease();
+    const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
+    // The selection does not wait when an event came while it decided, and asks again.
+    const bool eventCame = releaseEvents() != eventsBefore;
+    switch (choice.action) {
+        case ReleaseChoice::RELEASE:
+            recordReleases();
+            if (choice.frame.mIndex != NO_FRAME) {
+                releaseFrame(choice.frame);
+                return {Next::DECIDE, now};
+            }
+            // Nothing to release: the release thread waits for an event, as below.
+            break;
+        case ReleaseChoice::WAIT_FOR_TIME:
+            if (eventCame) return {Next::DECIDE, now};
+            // A wait of nothing is asked again at once, which on a thread takes some time; one
+            // nanosecond lets a clock that moves only with the host's events move on.
+            return {Next::WAIT_UNTIL, timeAfter(now, std::max<nsecs_t>(choice.waitTime, 1))};
+        case ReleaseChoice::RELEASE_AFTER_SLEEP:
+            // The blocking policy sleeps with usleep(), in whole microseconds.
+            return {Next::SLEEP_UNTIL,
+                    timeAfter(now, std::max<nsecs_t>(choice.waitTime, 0) / 1000 * 1000)};
+        default:
+            break;
+    }
+    if (eventCame) return {Next::DECIDE, now};
+    return {Next::WAIT_FOR_EVENT, timeAfter(now, ReleasePicker::EVENT_WAIT_TIMEOUT)};
+}
+
+void LayerHost::finishSleepingRelease() {
+    if (mPicker == nullptr) return;
+    const FrameItem frame = mPicker->chooseOldestFrame().frame;
+    recordReleases();
+    if (frame.mIndex != NO_FRAME) releaseFrame(frame);
+}
+
+uint64_t LayerHost::releaseEvents() const {
+    std::lock_guard lock(mChangeMutex);
+    return mQueueChanges;
 }
 
 void LayerHost::setLeavingFrame(uint64_t frameNumber) {

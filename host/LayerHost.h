@@ -70,6 +70,32 @@ public:
 
     // Starts the release thread.
     void start();
+
+    // What the release side does next after stepRelease(), for a host that keeps time itself and
+    // runs no release thread (a simulation). A wait ends at the time given or, unless it is a
+    // sleep, at the next event the picker decides on (releaseEvents() moves), whichever comes
+    // first; then the host calls stepRelease() again (after a sleep, finishSleepingRelease()).
+    struct ReleaseStep {
+        enum class Next {
+            DECIDE,          // decide again at once: a frame went, or an event came meanwhile
+            WAIT_FOR_EVENT,  // nothing to release; `until` is where the event wait runs out
+            WAIT_UNTIL,      // the policy asked to be asked again at `until`
+            SLEEP_UNTIL,     // the latency picker's sleep: no decision until `until`
+        };
+        Next next = Next::DECIDE;
+        nsecs_t until = 0;
+    };
+    // One step of what the release thread does, without its waits: one decision through the
+    // picker's decideRelease(), the release it names, and what to wait for. Both hosts run the
+    // same decisions; the release thread blocks in selectFrameForRelease() instead. Called between
+    // compositions (a composed frame stays locked until onCompositionDone), never while the
+    // release thread runs.
+    ReleaseStep stepRelease();
+    // The end of a SLEEP_UNTIL: releases the oldest frame as it is now, as the latency picker
+    // does after its sleep.
+    void finishSleepingRelease();
+    // Counts the events after which the picker may decide otherwise.
+    uint64_t releaseEvents() const;
     // Tear-down, in the order that never blocks: no more waiting on frame locks, the picker stops,
     // which ends the release thread's wait whatever it waits for, the release thread ends, the
     // frames still queued are handed back. Refreshes and buffers must have stopped.
@@ -118,6 +144,8 @@ private:
     void noteQueueChange();
     void noteFrameLeft(uint64_t frameNumber, int slot);
     void releaseLoop(android::sp<android::Interpolation::ReleasePicker> picker);
+    // Takes the frame the picker chose out of the list and hands it back.
+    void releaseFrame(const android::FrameItem& frame);
     void setLeavingFrame(uint64_t frameNumber);
     void recordReleases();
     void latchNewestFrame();
@@ -152,7 +180,7 @@ private:
     std::atomic<bool> mRunning{false};
     std::thread mReleaseThread;
 
-    std::mutex mChangeMutex;  // a leaf lock: taken from event delivery
+    mutable std::mutex mChangeMutex;  // a leaf lock: taken from event delivery
     std::condition_variable mQueueChanged;
     uint64_t mQueueChanges = 0;  // guarded by mChangeMutex
 
