@@ -15,7 +15,9 @@ namespace android {
 
 const sp<Fence> Fence::NO_FENCE = new Fence();
 
-Fence::Fence(base::unique_fd fenceFd) : mFenceFd(std::move(fenceFd)) {}
+Fence::Fence(base::unique_fd fenceFd) : mValid(fenceFd.ok()), mFenceFd(std::move(fenceFd)) {}
+
+Fence::Fence(Pending) : mValid(true) {}
 
 Fence::~Fence() {
 #ifdef VEROLUX_THREAD_SANITIZER
@@ -26,9 +28,38 @@ Fence::~Fence() {
 #endif
 }
 
+int Fence::get() const {
+    if (!mValid) return -1;
+    std::lock_guard lock(mMutex);
+    return descriptorLocked();
+}
+
+int Fence::descriptorLocked() const {
+    if (!mFenceFd.ok()) {
+        mFenceFd.reset(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
+        if (!mFenceFd.ok()) {
+            ALOGE("Fence: eventfd failed (errno %d)", errno);
+            return -1;
+        }
+        // Signalled before anyone asked for the descriptor: readable from the start.
+        if (mSignalTime.load(std::memory_order_acquire) != SIGNAL_TIME_PENDING) {
+            const uint64_t one = 1;
+            if (::write(mFenceFd.get(), &one, sizeof(one)) != sizeof(one)) {
+                ALOGE("Fence: signalling fd %d failed (errno %d)", mFenceFd.get(), errno);
+            }
+        }
+    }
+    return mFenceFd.get();
+}
+
 status_t Fence::wait(int timeout) const {
-    if (!mFenceFd.ok()) return NO_ERROR;
-    pollfd pfd{mFenceFd.get(), POLLIN, 0};
+    if (!mValid || mSignalTime.load(std::memory_order_acquire) != SIGNAL_TIME_PENDING) {
+        return NO_ERROR;
+    }
+    if (timeout == 0) return TIMED_OUT;
+    const int fd = get();
+    if (fd < 0) return TIMED_OUT;
+    pollfd pfd{fd, POLLIN, 0};
     int ret;
     do {
         ret = poll(&pfd, 1, timeout);
@@ -37,17 +68,12 @@ status_t Fence::wait(int timeout) const {
 }
 
 nsecs_t Fence::getSignalTime() const {
-    if (!mFenceFd.ok()) return SIGNAL_TIME_INVALID;
+    if (!mValid) return SIGNAL_TIME_INVALID;
     return mSignalTime.load(std::memory_order_acquire);
 }
 
 sp<Fence> Fence::createPending() {
-    base::unique_fd fd(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
-    if (!fd.ok()) {
-        ALOGE("Fence: eventfd failed (errno %d)", errno);
-        return NO_FENCE;
-    }
-    return new Fence(std::move(fd));
+    return new Fence(Pending{});
 }
 
 sp<Fence> Fence::createSignalled(nsecs_t signalTime) {
@@ -57,13 +83,16 @@ sp<Fence> Fence::createSignalled(nsecs_t signalTime) {
 }
 
 void Fence::signal(nsecs_t signalTime) {
-    if (!mFenceFd.ok()) return;
+    if (!mValid) return;
     // The time is published before the fd becomes readable, so a waiter that sees the fence
     // signalled also sees its signal time.
     nsecs_t pending = SIGNAL_TIME_PENDING;
     if (!mSignalTime.compare_exchange_strong(pending, signalTime, std::memory_order_release)) {
         return;
     }
+    // A descriptor made from here on is made readable by whoever makes it.
+    std::lock_guard lock(mMutex);
+    if (!mFenceFd.ok()) return;
     const uint64_t one = 1;
     if (::write(mFenceFd.get(), &one, sizeof(one)) != sizeof(one)) {
         ALOGE("Fence: signalling fd %d failed (errno %d)", mFenceFd.get(), errno);

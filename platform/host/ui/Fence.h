@@ -9,11 +9,14 @@
 #include <atomic>
 #include <cstdint>
 #include <limits>
+#include <mutex>
 
 namespace android {
 
-// A sync fence backed by an eventfd: it is signalled once the eventfd becomes readable.
-// On the device the kernel signals fences; on the host, producers call signal().
+// A sync fence. On the device the kernel signals fences; on the host, producers call signal(),
+// and the fence's descriptor is an eventfd that becomes readable then. The descriptor is made
+// when it is first needed (get(), or a wait that may block): most fences are only asked whether
+// they have signalled, and a descriptor costs three system calls in its life.
 class Fence : public LightRefBase<Fence> {
 public:
     static const sp<Fence> NO_FENCE;
@@ -26,8 +29,9 @@ public:
     Fence(const Fence&) = delete;
     Fence& operator=(const Fence&) = delete;
 
-    bool isValid() const { return mFenceFd.ok(); }
-    int get() const { return mFenceFd.get(); }
+    bool isValid() const { return mValid; }
+    // The descriptor, -1 for an invalid fence (or when no eventfd could be made).
+    int get() const;
 
     // Polls the fence for at most timeout ms (0 never blocks, -1 waits for ever).
     // Returns NO_ERROR once signalled, TIMED_OUT otherwise.
@@ -45,7 +49,14 @@ private:
     friend class LightRefBase<Fence>;
     ~Fence();
 
-    base::unique_fd mFenceFd;
+    struct Pending {};
+    explicit Fence(Pending);
+    // The descriptor, made on first use.
+    int descriptorLocked() const;
+
+    const bool mValid = false;
+    mutable std::mutex mMutex;
+    mutable base::unique_fd mFenceFd;  // guarded by mMutex
     std::atomic<nsecs_t> mSignalTime{SIGNAL_TIME_PENDING};
 };
 
