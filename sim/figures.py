@@ -9,7 +9,6 @@ them. The measures follow the README's definitions, as the simulator's summary d
 Exits with status 3, printing nothing, when matplotlib is missing.
 """
 
-import csv
 import json
 import os
 import sys
@@ -28,19 +27,52 @@ NS_PER_MS = 1e6
 NS_PER_S = 1e9
 COLOURS = {"run": "#1f5fbf", "reference": "#e07b00"}
 PICTURE_COLOURS = {"blend": "#2870ff", "new": "#28c846", "repeat": "#e62828", "held": "#000000"}
+PICTURE_CODES = {name: code for code, name in enumerate(PICTURE_COLOURS)}
 DPI = 100
+# An hour of play is hundreds of thousands of rows: the figures draw at most this many points per
+# series (each time bin's extremes and an even sample of the rest), and at most this many bars.
+MAX_POINTS = 40000
+MAX_BARS = 240
+FEW_BARS = 60
 
 
-def read_csv(path):
+def read_columns(path, names, optional=()):
+    """The named columns of a CSV file as float arrays, read by numpy's parser: NaN for an empty
+    cell of an optional column; a picture column becomes its code in PICTURE_CODES."""
     if not os.path.exists(path):
-        return []
-    with open(path, newline="") as f:
-        return list(csv.DictReader(f))
+        return {name: np.zeros(0) for name in names}
+    with open(path) as f:
+        header = f.readline().strip().split(",")
+    indices = [header.index(name) for name in names]
+    nan = float("nan")
+    converters = {}
+    for name, index in zip(names, indices):
+        if name == "picture":
+            converters[index] = lambda text: PICTURE_CODES[text]
+        elif name in optional:
+            converters[index] = lambda text: float(text) if text else nan
+    table = np.loadtxt(path, delimiter=",", skiprows=1, usecols=indices, dtype=np.float64,
+                       converters=converters, encoding="ascii", ndmin=2)
+    return {name: table[:, i] for i, name in enumerate(names)}
 
 
-def column(rows, name, keep=lambda row: True):
-    """The column as floats, leaving out empty cells and rows `keep` refuses."""
-    return np.array([float(r[name]) for r in rows if r[name] != "" and keep(r)], dtype=float)
+def thin(x, y):
+    """At most about MAX_POINTS of the points (x in order): each time bin's lowest and highest,
+    so that no spike is lost, and an even sample of the rest, so that bands stay visible."""
+    if len(x) <= MAX_POINTS:
+        return x, y
+    bins = MAX_POINTS // 4
+    edges = np.linspace(x[0], x[-1], bins + 1)
+    which = np.clip(np.searchsorted(edges, x, side="right") - 1, 0, bins - 1)
+    keep = np.zeros(len(x), dtype=bool)
+    keep[:: max(1, len(x) // (MAX_POINTS // 2))] = True
+    order = np.lexsort((y, which))  # by bin, then by value
+    starts = np.searchsorted(which[order], np.arange(bins))
+    ends = np.searchsorted(which[order], np.arange(bins), side="right")
+    present = ends > starts
+    keep[order[starts[present]]] = True
+    keep[order[ends[present] - 1]] = True
+    return x[keep], y[keep]
 
 
 class Layer:
@@ -48,46 +80,48 @@ class Layer:
         self.role = entry["role"]
         self.title = entry["title"]
         self.prefix = entry["prefix"]
-        self.frames = read_csv(os.path.join(folder, self.prefix + "frames.csv"))
-        self.refreshes = read_csv(os.path.join(folder, self.prefix + "refreshes.csv"))
+        self.frames = read_columns(os.path.join(folder, self.prefix + "frames.csv"),
+                                   ["frame", "queue_ns", "first_present_ns"],
+                                   optional=("queue_ns", "first_present_ns"))
+        self.refreshes = read_columns(os.path.join(folder, self.prefix + "refreshes.csv"),
+                                      ["refresh", "present_ns", "picture", "content_ns", "delay_ns"],
+                                      optional=("content_ns", "delay_ns"))
         self.rows_png = os.path.join(folder, self.prefix + "spacetime-rows.png")
         self.colour = COLOURS.get(self.role, "#555555")
 
     def game_frame_times(self):
         """(queue time in s, time since the previous queued frame in ms)."""
-        queued = sorted(
-            (int(r["frame"]), float(r["queue_ns"])) for r in self.frames if r["queue_ns"] != ""
-        )
-        q = np.array([t for _, t in queued])
+        order = np.argsort(self.frames["frame"], kind="stable")
+        q = self.frames["queue_ns"][order]
+        q = q[~np.isnan(q)]
         return q[1:] / NS_PER_S, np.diff(q) / NS_PER_MS
 
     def display_frame_times(self):
         """(present time in s, time since the previous new picture in ms)."""
-        p = column(self.refreshes, "present_ns", lambda r: r["picture"] in ("blend", "new"))
+        picture = self.refreshes["picture"]
+        new = (picture == PICTURE_CODES["blend"]) | (picture == PICTURE_CODES["new"])
+        p = self.refreshes["present_ns"][new]
         return p[1:] / NS_PER_S, np.diff(p) / NS_PER_MS
+
+    def shown(self):
+        """(present, content) of the refreshes that showed something."""
+        content = self.refreshes["content_ns"]
+        has = ~np.isnan(content)
+        return self.refreshes["present_ns"][has], content[has]
 
     def animation_errors(self):
         """|content step - present step| between consecutive refreshes showing something, ms."""
-        shown = [r for r in self.refreshes if r["content_ns"] != ""]
-        content = np.array([float(r["content_ns"]) for r in shown])
-        present = np.array([float(r["present_ns"]) for r in shown])
+        present, content = self.shown()
         return np.abs(np.diff(content) - np.diff(present)) / NS_PER_MS
 
     def latencies(self):
         """Queue to the first present at which the frame led the picture, ms."""
-        return np.array(
-            [
-                (float(r["first_present_ns"]) - float(r["queue_ns"])) / NS_PER_MS
-                for r in self.frames
-                if r["first_present_ns"] != "" and r["queue_ns"] != ""
-            ]
-        )
+        latency = self.frames["first_present_ns"] - self.frames["queue_ns"]
+        return latency[~np.isnan(latency)] / NS_PER_MS
 
     def content_ages(self):
-        shown = [r for r in self.refreshes if r["content_ns"] != ""]
-        return np.array(
-            [(float(r["present_ns"]) - float(r["content_ns"])) / NS_PER_MS for r in shown]
-        )
+        present, content = self.shown()
+        return (present - content) / NS_PER_MS
 
 
 def nearest_rank(values, p):
@@ -112,7 +146,7 @@ def frame_times(folder, layers):
     for ax, title, series in panels:
         # Points, not lines: a frame time that alternates (8 and 17 ms) shows as two bands.
         for layer in reversed(layers):
-            x, y = series(layer)
+            x, y = thin(*series(layer))
             if len(y):
                 ax.plot(x, y, ".", markersize=3, color=layer.colour, label=layer.title)
         ax.set_title(title)
@@ -157,6 +191,9 @@ def cdf(ax, values, layer, unit):
         return
     ordered = np.sort(values)
     share = np.arange(1, len(ordered) + 1) * 100.0 / len(ordered)
+    if len(ordered) > MAX_POINTS:
+        pick = np.unique(np.linspace(0, len(ordered) - 1, MAX_POINTS).astype(int))
+        ordered, share = ordered[pick], share[pick]
     p50, p99 = nearest_rank(values, 50), nearest_rank(values, 99)
     ax.plot(ordered, share, color=layer.colour,
             label="%s (p50 %.1f, p99 %.1f %s)" % (layer.title, p50, p99, unit))
@@ -186,11 +223,15 @@ def latency(folder, layers):
 def delay(folder, layers):
     run = layers[0]
     fig, axes = plt.subplots(2, 1, figsize=(10, 6), sharex=True)
-    rows = [r for r in run.refreshes if r["delay_ns"] != ""]
-    if rows:
-        t = np.array([float(r["present_ns"]) for r in rows]) / NS_PER_S
-        d = np.array([float(r["delay_ns"]) for r in rows]) / NS_PER_MS
-        axes[0].plot(t, d, drawstyle="steps-post", color=run.colour, label=run.title)
+    has_delay = ~np.isnan(run.refreshes["delay_ns"])
+    if has_delay.any():
+        t = run.refreshes["present_ns"][has_delay] / NS_PER_S
+        d = run.refreshes["delay_ns"][has_delay] / NS_PER_MS
+        # A step at each change, and the last value held to the end.
+        change = np.concatenate(([True], d[1:] != d[:-1]))
+        change[-1] = True
+        axes[0].plot(t[change], d[change], drawstyle="steps-post", color=run.colour,
+                     label=run.title)
         axes[0].set_ylim(0, max(d.max() * 1.2, 1))
         axes[0].legend(fontsize=8, loc="lower right")
     else:
@@ -200,23 +241,33 @@ def delay(folder, layers):
     axes[0].set_ylabel("display delay (ms)")
     axes[0].grid(alpha=0.3)
 
-    present = np.array([float(r["present_ns"]) for r in run.refreshes]) / NS_PER_S
-    pictures = [r["picture"] for r in run.refreshes]
+    present = run.refreshes["present_ns"] / NS_PER_S
+    kinds = run.refreshes["picture"]
+    width = 1
     if len(present):
-        seconds = np.floor(present).astype(int)
-        edges = np.arange(seconds.min(), seconds.max() + 1)
-        # The first and last seconds are partly covered: count per second of what was covered.
-        covered = np.array([min(e + 1, present.max()) - max(e, present.min()) for e in edges])
+        # A bar per second, or per some seconds in a long run.
+        width = max(1, int(np.ceil((present.max() - present.min()) / MAX_BARS)))
+        slots = np.floor(present / width).astype(int)
+        edges = np.arange(slots.min(), slots.max() + 1)
+        # The first and last bars are partly covered: count per second of what was covered.
+        covered = np.minimum((edges + 1) * width, present.max()) - np.maximum(edges * width,
+                                                                             present.min())
         covered = np.maximum(covered, 1e-3)
         bottom = np.zeros(len(edges))
-        kinds = np.array(pictures)
         for kind, colour in PICTURE_COLOURS.items():
-            counts = np.bincount(seconds[kinds == kind] - edges[0], minlength=len(edges))
+            counts = np.bincount(slots[kinds == PICTURE_CODES[kind]] - edges[0],
+                                 minlength=len(edges))
             counts = counts[: len(edges)] / covered
-            axes[1].bar(edges + 0.5, counts, width=0.9, bottom=bottom, color=colour, label=kind)
+            if len(edges) <= FEW_BARS:
+                axes[1].bar((edges + 0.5) * width, counts, width=0.9 * width, bottom=bottom,
+                            color=colour, label=kind)
+            else:  # one shape per kind: many bars take matplotlib long to draw
+                axes[1].stairs(bottom + counts, np.append(edges, edges[-1] + 1) * width,
+                               baseline=bottom.copy(), fill=True, color=colour, label=kind)
             bottom += counts
         axes[1].set_ylim(0, bottom.max() * 1.25)
-    axes[1].set_title("What the screen showed each second (%s)" % run.title)
+    per = "each second" if width == 1 else "per second, in bars of %d s" % width
+    axes[1].set_title("What the screen showed %s (%s)" % (per, run.title))
     axes[1].set_ylabel("refreshes per second")
     axes[1].set_xlabel("time in the run (s)")
     axes[1].legend(fontsize=8, ncol=4, loc="upper right")
@@ -234,13 +285,15 @@ def spacetime(folder, layers):
     for ax, layer in zip(axes[0], drawn):
         image = Image.open(layer.rows_png)
         first, count = int(image.text["first_refresh"]), int(image.text["rows"])
-        rows = [r for r in layer.refreshes if int(r["refresh"]) >= first][:count]
-        present = np.array([float(r["present_ns"]) for r in rows]) / NS_PER_S
+        rows = np.flatnonzero(layer.refreshes["refresh"] >= first)[:count]
+        present = layer.refreshes["present_ns"][rows] / NS_PER_S
+        names = list(PICTURE_COLOURS)
+        kinds = [names[int(code)] for code in layer.refreshes["picture"][rows]]
         pixels = np.asarray(image.convert("RGB"))
         width = pixels.shape[1]
         top, bottom = present[0], present[-1]
         # A strip on the left gives what each row was.
-        strip = np.array([[matplotlib.colors.to_rgb(PICTURE_COLOURS[r["picture"]])] for r in rows])
+        strip = np.array([[matplotlib.colors.to_rgb(PICTURE_COLOURS[kind])] for kind in kinds])
         margin = max(4, width // 40)
         ax.imshow(np.repeat(strip, margin, axis=1), extent=(-margin - 2, -2, bottom, top),
                   aspect="auto", interpolation="nearest")
