@@ -25,16 +25,25 @@ BufferQueue::BufferQueue(uint32_t slots, uint32_t width, uint32_t height)
       mStates(slots, State::FREE),
       mFrameNumbers(slots, 0) {}
 
+int BufferQueue::takeFreeSlotLocked() {
+    if (mClosed) return -1;
+    auto free = std::find(mStates.begin(), mStates.end(), State::FREE);
+    if (free == mStates.end()) return -1;
+    *free = State::DEQUEUED;
+    return static_cast<int>(free - mStates.begin());
+}
+
+int BufferQueue::tryDequeue() {
+    std::lock_guard lock(mMutex);
+    return takeFreeSlotLocked();
+}
+
 int BufferQueue::dequeue(const std::function<void()>& onNoFreeSlot) {
     std::unique_lock lock(mMutex);
     bool waited = false;
     while (true) {
         if (mClosed) return -1;
-        auto free = std::find(mStates.begin(), mStates.end(), State::FREE);
-        if (free != mStates.end()) {
-            *free = State::DEQUEUED;
-            return static_cast<int>(free - mStates.begin());
-        }
+        if (const int slot = takeFreeSlotLocked(); slot >= 0) return slot;
         if (!waited && onNoFreeSlot) onNoFreeSlot();
         waited = true;
         mSlotFreed.wait(lock);
@@ -61,7 +70,11 @@ void BufferQueue::acquireReady(const std::function<void(const QueuedBuffer&)>& o
         QueuedBuffer next;
         {
             std::lock_guard lock(mMutex);
-            if (mQueued.empty() || mQueued.front().fence->wait(0) != android::NO_ERROR) return;
+            // Rendering is done once the fence has its signal time, which needs no system call.
+            if (mQueued.empty() ||
+                mQueued.front().fence->getSignalTime() == android::Fence::SIGNAL_TIME_PENDING) {
+                return;
+            }
             next = mQueued.front();
             mQueued.pop_front();
             mStates[next.slot] = State::ACQUIRED;

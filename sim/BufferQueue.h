@@ -28,6 +28,8 @@ public:
     // Blocks until a slot is free; -1 once the queue is closed. When none is free at first,
     // `onNoFreeSlot` runs once, under the queue's lock, before the wait.
     int dequeue(const std::function<void()>& onNoFreeSlot = {});
+    // A free slot without waiting; -1 when none is free or the queue is closed.
+    int tryDequeue();
     // Queuing takes two steps, so that the compositor hears of a buffer only after the engine has
     // intercepted it, while a release that comes in between already finds the slot queued.
     void markQueued(int slot, uint64_t frameNumber);
@@ -45,6 +47,8 @@ public:
 
 private:
     enum class State { FREE, DEQUEUED, QUEUED, ACQUIRED };
+
+    int takeFreeSlotLocked();
 
     const std::vector<android::sp<android::GraphicBuffer>> mBuffers;
     std::mutex mMutex;

@@ -24,25 +24,24 @@ nsecs_t threadCpuTime() {
 
 }  // namespace
 
-Compositor::Compositor(nsecs_t refreshPeriod, uint32_t width, std::vector<DisplayedLayer> layers,
-                       double clientCompositionShare, uint64_t seed)
-    : mRefreshPeriod(refreshPeriod),
-      mWidth(width),
+Compositor::Compositor(const Config& config, std::vector<DisplayedLayer> layers)
+    : mConfig(config),
       mLayers(std::move(layers)),
       mScreens(mLayers.size()),
-      mAccumulator(size_t{width} * 3),
-      mClientCompositionShare(clientCompositionShare),
-      mRandom(seed) {
-    for (Screen& screen : mScreens)
-        screen.scanline.assign(size_t{width} * 3, 0);
+      mAccumulator(size_t{config.width} * 4),
+      mRandom(config.seed) {
+    for (Screen& screen : mScreens) {
+        screen.scanline.assign(size_t{config.width} * 3, 0);
+        screen.nextStatistics = config.firstVsync + SECOND;
+    }
 }
 
 Compositor::~Compositor() {
     stop();
 }
 
-void Compositor::start(nsecs_t firstVsync) {
-    mThread = std::thread(&Compositor::run, this, firstVsync);
+void Compositor::start() {
+    mThread = std::thread(&Compositor::run, this);
 }
 
 void Compositor::stop() {
@@ -54,11 +53,8 @@ void Compositor::stop() {
     if (mThread.joinable()) mThread.join();
 }
 
-void Compositor::run(nsecs_t firstVsync) {
-    nsecs_t vsync = firstVsync;
-    for (Screen& screen : mScreens)
-        screen.nextStatistics = firstVsync + SECOND;
-    std::uniform_real_distribution<double> draw(0.0, 1.0);
+void Compositor::run() {
+    nsecs_t vsync = mConfig.firstVsync;
     while (true) {
         {
             std::unique_lock lock(mMutex);
@@ -66,25 +62,29 @@ void Compositor::run(nsecs_t firstVsync) {
                     std::chrono::steady_clock::time_point(std::chrono::nanoseconds(vsync));
             if (mStopped.wait_until(lock, deadline, [this] { return mStopping; })) return;
         }
-        const auto index = static_cast<uint64_t>((vsync - firstVsync) / mRefreshPeriod);
-        const nsecs_t present = vsync + mRefreshPeriod;
-        const auto presentFence =
-                std::make_shared<android::FenceTime>(android::Fence::createSignalled(present));
-        const bool clientComposed =
-                mClientCompositionShare > 0 && draw(mRandom) < mClientCompositionShare;
-        for (size_t layer = 0; layer < mLayers.size(); layer++) {
-            refresh(layer, index, vsync, present, presentFence, clientComposed);
-        }
-        vsync += mRefreshPeriod;
+        refresh(vsync);
+        vsync += mConfig.refreshPeriod;
         const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
         while (vsync < now)
-            vsync += mRefreshPeriod;
+            vsync += mConfig.refreshPeriod;
     }
 }
 
-void Compositor::refresh(size_t layerIndex, uint64_t index, nsecs_t vsync, nsecs_t present,
-                         const std::shared_ptr<android::FenceTime>& presentFence,
-                         bool clientComposed) {
+void Compositor::refresh(nsecs_t vsync) {
+    const auto index = static_cast<uint64_t>((vsync - mConfig.firstVsync) / mConfig.refreshPeriod);
+    const nsecs_t present = vsync + mConfig.refreshPeriod;
+    const auto presentFence =
+            std::make_shared<android::FenceTime>(android::Fence::createSignalled(present));
+    const bool clientComposed = mConfig.clientCompositionShare > 0 &&
+                                mClientDraw(mRandom) < mConfig.clientCompositionShare;
+    for (size_t layer = 0; layer < mLayers.size(); layer++) {
+        refreshLayer(layer, index, vsync, present, presentFence, clientComposed);
+    }
+}
+
+void Compositor::refreshLayer(size_t layerIndex, uint64_t index, nsecs_t vsync, nsecs_t present,
+                              const std::shared_ptr<android::FenceTime>& presentFence,
+                              bool clientComposed) {
     const DisplayedLayer& layer = mLayers[layerIndex];
     LayerRecorder& recorder = *layer.recorder;
     layer.queue->acquireReady([&](const BufferQueue::QueuedBuffer& queued) {
@@ -100,25 +100,27 @@ void Compositor::refresh(size_t layerIndex, uint64_t index, nsecs_t vsync, nsecs
     record.vsyncTime = vsync;
     record.presentTime = present;
 
-    const nsecs_t cpuBefore = threadCpuTime();
+    const bool measureCpu = mConfig.measureCpu;
+    const nsecs_t cpuBefore = measureCpu ? threadCpuTime() : 0;
     const bool presents = layer.host->onVsync(vsync);
     const RenderState& state = presents ? layer.host->compose(vsync) : mNothing;
-    const nsecs_t cpuComposed = threadCpuTime();
+    const nsecs_t cpuComposed = measureCpu ? threadCpuTime() : 0;
     record.refused = !presents;
     record.clientComposed = clientComposed;
 
     // With nothing to draw, the previous picture stays on screen.
     Screen& screen = mScreens[layerIndex];
-    blend(state, record, screen);
+    const bool pixels = present < mConfig.picturesUntil;
+    blend(state, record, screen, pixels);
     recorder.composed(record);
 
-    const nsecs_t cpuReturning = threadCpuTime();
+    const nsecs_t cpuReturning = measureCpu ? threadCpuTime() : 0;
     layer.host->onCompositionDone(state, vsync, presentFence,
                                   clientComposed ? host::LayerHost::CompositionType::CLIENT
                                                  : host::LayerHost::CompositionType::DEVICE);
-    record.cpuTime = (cpuComposed - cpuBefore) + (threadCpuTime() - cpuReturning);
+    if (measureCpu) record.cpuTime = (cpuComposed - cpuBefore) + (threadCpuTime() - cpuReturning);
     record.queueLength = static_cast<uint32_t>(layer.host->frameList()->size());
-    record.scanline = screen.scanline;
+    if (pixels) record.scanline = screen.scanline;
     const host::LayerHost::Status status = layer.host->status();
     record.interpolating = status.interpolating;
     record.refreshRate = status.refreshRate;
@@ -132,7 +134,8 @@ void Compositor::refresh(size_t layerIndex, uint64_t index, nsecs_t vsync, nsecs
     }
 }
 
-void Compositor::blend(const RenderState& state, RefreshRecord& record, Screen& screen) {
+void Compositor::blend(const RenderState& state, RefreshRecord& record, Screen& screen,
+                       bool pixels) {
     // Each item covers what is below it by its alpha; the bottom item is opaque.
     const size_t count = std::min(state.items.size(), RefreshRecord::MAX_ITEMS);
     std::array<float, RefreshRecord::MAX_ITEMS> weights{};
@@ -152,7 +155,7 @@ void Compositor::blend(const RenderState& state, RefreshRecord& record, Screen& 
         composed.frameNumber = item.frame.isEmpty() ? 0 : item.frame.mIndex;
         composed.alpha = item.alpha;
         composed.weight = item.frame.isEmpty() ? 0.0f : weights[i];
-        if (item.frame.isEmpty() || weights[i] <= 0.0f) continue;
+        if (!pixels || item.frame.isEmpty() || weights[i] <= 0.0f) continue;
 
         android::GraphicBuffer& buffer = *item.frame.mGraphicBuffer;
         void* pixels = nullptr;
@@ -161,17 +164,24 @@ void Compositor::blend(const RenderState& state, RefreshRecord& record, Screen& 
         }
         const auto* row = static_cast<const uint8_t*>(pixels) +
                           size_t{buffer.getHeight() / 2} * buffer.getStride() * 4;
-        const uint32_t width = std::min(mWidth, buffer.getWidth());
-        for (uint32_t x = 0; x < width; x++) {
-            for (int c = 0; c < 3; c++)
-                mAccumulator[x * 3 + c] += weights[i] * row[x * 4 + c];
-        }
+        // The row as it lies (RGBA), so that this loop runs over contiguous values.
+        const size_t values = size_t{std::min(mConfig.width, buffer.getWidth())} * 4;
+        const float weight = weights[i];
+        float* accumulator = mAccumulator.data();
+        for (size_t v = 0; v < values; v++)
+            accumulator[v] += weight * static_cast<float>(row[v]);
         buffer.unlock();
         drawn = true;
     }
     if (!drawn) return;
-    for (size_t i = 0; i < mAccumulator.size(); i++) {
-        screen.scanline[i] = static_cast<uint8_t>(std::lround(std::min(255.0f, mAccumulator[i])));
+    const float* accumulator = mAccumulator.data();
+    uint8_t* scanline = screen.scanline.data();
+    for (size_t x = 0; x < mConfig.width; x++) {
+        for (size_t c = 0; c < 3; c++) {
+            // Rounded to the nearest value; the sum is never negative.
+            scanline[x * 3 + c] =
+                    static_cast<uint8_t>(std::min(255.0f, accumulator[x * 4 + c]) + 0.5f);
+        }
     }
 }
 

@@ -2,6 +2,7 @@
 
 #include <atomic>
 #include <condition_variable>
+#include <limits>
 #include <mutex>
 #include <random>
 #include <thread>
@@ -26,19 +27,36 @@ struct DisplayedLayer {
 // recorded), and hands the frames back. A layer that does not present keeps its picture. A share of
 // the compositions, drawn at random from the seed, falls back to client composition (the same
 // picture, composed by the GPU). Once a second of vsyncs it records each layer's statistics. Each
-// refresh reaches the screen one period after its vsync, when its present fence signals. A display
-// that fell behind real time skips the vsyncs it missed, as a real one would; refresh indices count
-// vsyncs, so the skipped ones show as gaps.
+// refresh reaches the screen one period after its vsync, when its present fence signals.
+//
+// In real time the display runs on a thread of its own (start, stop); a display that fell behind
+// real time skips the vsyncs it missed, as a real one would, and refresh indices count vsyncs, so
+// the skipped ones show as gaps. In simulated time the caller calls refresh() at every vsync.
 class Compositor {
 public:
-    Compositor(nsecs_t refreshPeriod, uint32_t width, std::vector<DisplayedLayer> layers,
-               double clientCompositionShare = 0, uint64_t seed = 1);
+    struct Config {
+        nsecs_t refreshPeriod = 0;
+        nsecs_t firstVsync = 0;
+        uint32_t width = 0;                 // of the picture, in pixels
+        double clientCompositionShare = 0;  // compositions that fall back to client composition
+        uint64_t seed = 1;
+        // Whether a refresh records the library's CPU time, from the thread's CPU clock.
+        bool measureCpu = true;
+        // Only the pictures presented before this time are blended into pixels and recorded as
+        // scanlines: nothing looks at the later ones. What each picture is made of is always
+        // recorded.
+        nsecs_t picturesUntil = std::numeric_limits<nsecs_t>::max();
+    };
+
+    Compositor(const Config& config, std::vector<DisplayedLayer> layers);
     ~Compositor();
     Compositor(const Compositor&) = delete;
     Compositor& operator=(const Compositor&) = delete;
 
-    void start(nsecs_t firstVsync);
+    void start();
     void stop();
+    // Composes every layer at `vsync`, a whole number of periods after the first.
+    void refresh(nsecs_t vsync);
 
 private:
     struct Screen {
@@ -46,20 +64,20 @@ private:
         nsecs_t nextStatistics = 0;     // the vsync from which the statistics are due
     };
 
-    void run(nsecs_t firstVsync);
-    void refresh(size_t layer, uint64_t index, nsecs_t vsync, nsecs_t present,
-                 const std::shared_ptr<android::FenceTime>& presentFence, bool clientComposed);
-    // Blends the state's items into the layer's scanline, and notes each item's weight in it.
+    void run();
+    void refreshLayer(size_t layer, uint64_t index, nsecs_t vsync, nsecs_t present,
+                      const std::shared_ptr<android::FenceTime>& presentFence, bool clientComposed);
+    // Notes the state's items and their weights in the record, and blends them into the layer's
+    // scanline when `pixels` is set.
     void blend(const android::Interpolation::RenderState& state, RefreshRecord& record,
-               Screen& screen);
+               Screen& screen, bool pixels);
 
-    const nsecs_t mRefreshPeriod;
-    const uint32_t mWidth;
+    const Config mConfig;
     const std::vector<DisplayedLayer> mLayers;
-    std::vector<Screen> mScreens;  // display thread only
-    std::vector<float> mAccumulator;
-    const double mClientCompositionShare;
-    std::mt19937_64 mRandom;                             // display thread only
+    std::vector<Screen> mScreens;     // display thread only
+    std::vector<float> mAccumulator;  // RGBA, as the buffers' rows
+    std::mt19937_64 mRandom;          // display thread only
+    std::uniform_real_distribution<double> mClientDraw{0.0, 1.0};
     const android::Interpolation::RenderState mNothing;  // what a layer that does not present composes
 
     std::mutex mMutex;

@@ -5,27 +5,21 @@
 #include <cmath>
 #include <cstdio>
 
+#include "sim/TextLine.h"
+
 namespace verolux::sim {
 
 namespace {
 
 // Appends "," and the time from origin, or just "," when the time is absent.
-void time(std::ostream& out, nsecs_t time, nsecs_t origin) {
-    out << ',';
-    if (time >= 0) out << time - origin;
+void time(TextLine& line, nsecs_t time, nsecs_t origin) {
+    line << ',';
+    if (time >= 0) line << time - origin;
 }
 
-// The shortest text that reads back as the same float: alphas stay exact.
-void shortest(std::ostream& out, float value) {
-    char text[32];
-    const auto [end, ec] = std::to_chars(text, text + sizeof(text), value);
-    if (ec == std::errc()) out.write(text, end - text);
-}
-
-std::string ms(nsecs_t ns) {
-    char text[32];
-    snprintf(text, sizeof(text), "%.3f", static_cast<double>(ns) / 1e6);
-    return text;
+// Milliseconds with three places, from nanoseconds: "%.3f" of ns / 1e6.
+void ms(TextLine& line, nsecs_t ns) {
+    line.fixed(static_cast<double>(ns) / 1e6, 3);
 }
 
 }  // namespace
@@ -36,12 +30,14 @@ FramesCsv::FramesCsv(std::ostream& out, nsecs_t origin) : mOut(out), mOrigin(ori
 }
 
 void FramesCsv::onFrame(const FrameRecord& frame) {
-    mOut << frame.number;
+    TextLine line;
+    line << frame.number;
     for (nsecs_t t : {frame.startTime, frame.queueTime, frame.renderDoneTime, frame.acquireTime,
                       frame.firstPresentTime, frame.lastPresentTime, frame.releaseTime}) {
-        time(mOut, t, mOrigin);
+        time(line, t, mOrigin);
     }
-    mOut << ',' << (frame.dropped() ? 1 : 0) << '\n';
+    line << ',' << (frame.dropped() ? 1 : 0) << '\n';
+    line.writeTo(mOut);
 }
 
 RefreshesCsv::RefreshesCsv(std::ostream& out, nsecs_t origin) : mOut(out), mOrigin(origin) {
@@ -50,27 +46,31 @@ RefreshesCsv::RefreshesCsv(std::ostream& out, nsecs_t origin) : mOut(out), mOrig
 }
 
 void RefreshesCsv::onRefresh(const RefreshRecord& refresh) {
-    mOut << refresh.index;
-    time(mOut, refresh.vsyncTime, mOrigin);
-    time(mOut, refresh.presentTime, mOrigin);
-    mOut << ',' << pictureName(refresh.picture);
+    TextLine line;
+    line << refresh.index;
+    time(line, refresh.vsyncTime, mOrigin);
+    time(line, refresh.presentTime, mOrigin);
+    line << ',' << pictureName(refresh.picture);
     for (size_t i = 0; i < RefreshRecord::MAX_ITEMS; i++) {
-        mOut << ',';
+        line << ',';
         if (i < refresh.itemCount) {
-            mOut << refresh.items[i].frameNumber << ',';
-            shortest(mOut, refresh.items[i].alpha);
+            line << refresh.items[i].frameNumber << ',';
+            line.shortest(refresh.items[i].alpha);
         } else {
-            mOut << ',';
+            line << ',';
         }
     }
-    mOut << ',';
-    if (refresh.contentTime >= 0) mOut << std::llround(refresh.contentTime) - mOrigin;
-    mOut << ',';
-    if (refresh.delay >= 0) mOut << refresh.delay;
-    mOut << ',' << refresh.cpuTime << ',' << int{refresh.refused} << ','
-         << int{refresh.clientComposed} << ',' << refresh.refreshRate << ',';
-    if (refresh.gameRateLimitApplied) mOut << refresh.gameRateLimit;
-    mOut << '\n';
+    line << ',';
+    if (refresh.contentTime >= 0) line << std::llround(refresh.contentTime) - mOrigin;
+    line << ',';
+    if (refresh.delay >= 0) line << refresh.delay;
+    line << ',';
+    if (refresh.cpuTime >= 0) line << refresh.cpuTime;
+    line << ',' << int{refresh.refused} << ',' << int{refresh.clientComposed} << ','
+         << refresh.refreshRate << ',';
+    if (refresh.gameRateLimitApplied) line << refresh.gameRateLimit;
+    line << '\n';
+    line.writeTo(mOut);
 }
 
 PresentMonCsv::PresentMonCsv(std::ostream& out, nsecs_t origin, std::string application,
@@ -79,25 +79,35 @@ PresentMonCsv::PresentMonCsv(std::ostream& out, nsecs_t origin, std::string appl
     mOut << "Application,ProcessID,SwapChainAddress,Runtime,SyncInterval,PresentFlags,Dropped,"
             "TimeInSeconds,MsBetweenPresents,MsInPresentAPI,MsUntilRenderComplete,"
             "MsUntilDisplayed,MsBetweenDisplayChange\n";
+    char address[32];
+    snprintf(address, sizeof(address), "0x%x", mProcessId);
+    mSwapChainAddress = address;
 }
 
 void PresentMonCsv::onFrame(const FrameRecord& frame) {
     if (frame.queueTime < 0) return;  // never presented
-    char seconds[32];
-    snprintf(seconds, sizeof(seconds), "%.6f", static_cast<double>(frame.queueTime - mOrigin) / 1e9);
     const bool waited = frame.startTime >= 0 && frame.dequeueTime >= frame.startTime;
     const bool rendered = frame.renderDoneTime >= frame.queueTime;
     // As PresentMon writes them: 0 for the first present and for a frame never displayed.
     nsecs_t displayChange = 0;
     if (!frame.dropped() && mLastDisplayed >= 0)
         displayChange = frame.firstPresentTime - mLastDisplayed;
-    mOut << mApplication << ',' << mProcessId << ",0x" << std::hex << mProcessId << std::dec
-         << ",Other,1,0," << (frame.dropped() ? 1 : 0) << ',' << seconds << ','
-         << ms(mLastQueue >= 0 ? frame.queueTime - mLastQueue : 0) << ','
-         << ms(waited ? frame.dequeueTime - frame.startTime : 0) << ','
-         << ms(rendered ? frame.renderDoneTime - frame.queueTime : 0) << ','
-         << ms(frame.dropped() ? 0 : frame.firstPresentTime - frame.queueTime) << ','
-         << ms(displayChange) << '\n';
+    TextLine line;
+    line << mApplication << ',' << mProcessId << ',' << mSwapChainAddress << ",Other,1,0,"
+         << (frame.dropped() ? 1 : 0) << ',';
+    line.fixed(static_cast<double>(frame.queueTime - mOrigin) / 1e9, 6);
+    line << ',';
+    ms(line, mLastQueue >= 0 ? frame.queueTime - mLastQueue : 0);
+    line << ',';
+    ms(line, waited ? frame.dequeueTime - frame.startTime : 0);
+    line << ',';
+    ms(line, rendered ? frame.renderDoneTime - frame.queueTime : 0);
+    line << ',';
+    ms(line, frame.dropped() ? 0 : frame.firstPresentTime - frame.queueTime);
+    line << ',';
+    ms(line, displayChange);
+    line << '\n';
+    line.writeTo(mOut);
     mLastQueue = frame.queueTime;
     if (!frame.dropped()) mLastDisplayed = frame.firstPresentTime;
 }

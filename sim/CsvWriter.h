@@ -27,9 +27,9 @@ private:
 // refused,client,refresh_hz,game_limit_fps: one row per refresh; picture is blend, new, repeat or
 // held; frame0/alpha0 and frame1/alpha1 are the items of the engine's state (frame 0: the empty
 // frame); content_ns is the game time on screen; delay_ns the display delay in force; cpu_ns the
-// library's CPU time for the refresh; refused 1 when the render-rate agent refused the
-// presentation; client 1 when it fell back to client composition; refresh_hz the detected refresh
-// rate; game_limit_fps the game-rate limit the game was held to, empty when none.
+// library's CPU time for the refresh (empty when not measured); refused 1 when the render-rate
+// agent refused the presentation; client 1 when it fell back to client composition; refresh_hz the
+// detected refresh rate; game_limit_fps the game-rate limit the game was held to, empty when none.
 class RefreshesCsv final : public RecordSink {
 public:
     RefreshesCsv(std::ostream& out, nsecs_t origin);
@@ -54,6 +54,7 @@ private:
     const nsecs_t mOrigin;
     const std::string mApplication;
     const uint32_t mProcessId;
+    std::string mSwapChainAddress;  // the process id in hexadecimal, as PresentMon shows one
     nsecs_t mLastQueue = -1;
     nsecs_t mLastDisplayed = -1;
 };

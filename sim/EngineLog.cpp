@@ -1,7 +1,7 @@
 #include "sim/EngineLog.h"
 
 #include <android/log.h>
-#include <time.h>
+#include <utils/Timers.h>
 
 #include <cerrno>
 #include <cstring>
@@ -44,12 +44,14 @@ Status EngineLog::open(const std::string& path) {
 void EngineLog::write(const __android_logger_data* data, const char* message) {
     EngineLog* log = sOpenLog.load();
     if (log == nullptr) return;
-    timespec now{};
-    clock_gettime(CLOCK_MONOTONIC, &now);
+    // The library's own clock: the simulated one in simulated time, so that the log is the same
+    // for the same run.
+    const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
     std::lock_guard lock(log->mMutex);
     if (log->mFile == nullptr) return;
-    fprintf(log->mFile, "%ld.%06ld %c %s%s%s\n", static_cast<long>(now.tv_sec), now.tv_nsec / 1000,
-            priorityLetter(data->priority), data->tag != nullptr ? data->tag : "",
+    fprintf(log->mFile, "%ld.%06ld %c %s%s%s\n", static_cast<long>(now / 1'000'000'000),
+            static_cast<long>(now % 1'000'000'000 / 1000), priorityLetter(data->priority),
+            data->tag != nullptr ? data->tag : "",
             data->tag != nullptr && data->tag[0] != '\0' ? ": " : "", message);
     log->mLines++;
 }

@@ -9,17 +9,19 @@
 #include <utility>
 #include <vector>
 
+#include "sim/FenceScheduler.h"
+
 namespace verolux::sim {
 
-// The simulated GPU: signals each acquire fence when the frame's rendering is done.
-class FenceSignaller {
+// The simulated GPU in real time: a thread that signals each acquire fence when it is due.
+class FenceSignaller final : public FenceScheduler {
 public:
     FenceSignaller();
-    ~FenceSignaller();
+    ~FenceSignaller() override;
     FenceSignaller(const FenceSignaller&) = delete;
     FenceSignaller& operator=(const FenceSignaller&) = delete;
 
-    void signalAt(android::sp<android::Fence> fence, nsecs_t time);
+    void signalAt(android::sp<android::Fence> fence, nsecs_t time) override;
     // Signals what is still pending at once, and ends the thread.
     void stop();
 

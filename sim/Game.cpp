@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <chrono>
 #include <cmath>
-#include <random>
+#include <cstring>
 
 namespace verolux::sim {
 
@@ -15,25 +15,38 @@ constexpr nsecs_t SECOND = 1'000'000'000;
 // pacing draws a straight edge in the space-time picture and uneven pacing draws steps.
 constexpr nsecs_t CROSSING_TIME = 2'000'000'000;
 constexpr uint32_t BAR_WIDTH = 6;
-constexpr uint8_t BACKGROUND[] = {36, 38, 46};
-constexpr uint8_t BAR[] = {250, 230, 120};
+constexpr uint8_t BACKGROUND[] = {36, 38, 46, 255};
+constexpr uint8_t BAR[] = {250, 230, 120, 255};
 
 nsecs_t toNanos(double ms) {
     return static_cast<nsecs_t>(std::llround(ms * MS));
 }
 
+nsecs_t now() {
+    return systemTime(SYSTEM_TIME_MONOTONIC);
+}
+
 }  // namespace
 
-Game::Game(GameConfig config, BufferQueue& queue, host::LayerHost& host, FenceSignaller& gpu,
-           LayerRecorder& recorder)
-    : mConfig(config), mQueue(queue), mHost(host), mGpu(gpu), mRecorder(recorder) {}
+Game::Game(GameConfig config, BufferQueue& queue, host::LayerHost& host, FenceScheduler& gpu,
+           LayerRecorder& recorder, nsecs_t startTime)
+    : mConfig(config),
+      mQueue(queue),
+      mHost(host),
+      mGpu(gpu),
+      mRecorder(recorder),
+      mRandom(config.seed),
+      mJitter(0.0, config.jitterMs),
+      mRenderTime(config.renderMs, config.renderMs / 4),
+      mPeriod(toNanos(1000.0 / config.fps)),
+      mFrameStart(startTime) {}
 
 Game::~Game() {
     stop();
 }
 
-void Game::start(nsecs_t startTime) {
-    mThread = std::thread(&Game::run, this, startTime);
+void Game::start() {
+    mThread = std::thread(&Game::run, this);
 }
 
 void Game::stop() {
@@ -64,81 +77,95 @@ void Game::draw(android::GraphicBuffer& buffer, nsecs_t contentTime) {
         return;
     }
     const uint32_t width = buffer.getWidth();
+    auto* first = static_cast<uint8_t*>(pixels);
+    for (uint32_t x = 0; x < width; x++)
+        memcpy(first + x * 4, BACKGROUND, 4);
+    // The bar wraps around the right edge.
     const uint32_t bar = barPosition(contentTime, width);
-    for (uint32_t y = 0; y < buffer.getHeight(); y++) {
-        auto* row = static_cast<uint8_t*>(pixels) + size_t{y} * buffer.getStride() * 4;
-        for (uint32_t x = 0; x < width; x++) {
-            // The bar wraps around the right edge.
-            const bool onBar = (x + width - bar) % width < BAR_WIDTH;
-            const uint8_t* colour = onBar ? BAR : BACKGROUND;
-            std::copy(colour, colour + 3, row + x * 4);
-            row[x * 4 + 3] = 255;
-        }
-    }
+    for (uint32_t i = 0; i < BAR_WIDTH; i++)
+        memcpy(first + (bar + i) % width * 4, BAR, 4);
+    const size_t rowBytes = size_t{buffer.getStride()} * 4;
+    for (uint32_t y = 1; y < buffer.getHeight(); y++)
+        memcpy(first + y * rowBytes, first, size_t{width} * 4);
     buffer.unlock();
 }
 
-void Game::run(nsecs_t startTime) {
-    std::mt19937_64 random(mConfig.seed);
-    std::normal_distribution<double> jitter(0.0, mConfig.jitterMs);
-    std::normal_distribution<double> renderTime(mConfig.renderMs, mConfig.renderMs / 4);
-    const nsecs_t period = toNanos(1000.0 / mConfig.fps);
-    const std::vector<CaptureFrame>* capture =
-            mConfig.capture != nullptr ? &mConfig.capture->frames : nullptr;
-
-    nsecs_t frameStart = startTime;
-    size_t replayed = 0;  // the capture frame to play next
-    for (uint64_t number = 1;; number++) {
-        nsecs_t render = std::max<nsecs_t>(0, toNanos(renderTime(random)));
-        if (capture != nullptr) {
-            const CaptureFrame& frame = (*capture)[replayed];
-            if (frame.renderDoneTime >= 0) render = frame.renderDoneTime - frame.queueTime;
-        }
-        if (!sleepUntil(frameStart)) return;
-
-        const nsecs_t requestTime = systemTime(SYSTEM_TIME_MONOTONIC);
+void Game::run() {
+    while (mFrameStart >= 0) {
+        if (!sleepUntil(mFrameStart)) return;
+        const nsecs_t requestTime = now();
         const int slot = mQueue.dequeue([this] { mHost.onBufferBackpressure(); });
         if (slot < 0) return;
-        const nsecs_t dequeueTime = systemTime(SYSTEM_TIME_MONOTONIC);
-        // A game that had to wait for a buffer simulates its world from when it got one.
-        const nsecs_t contentTime = std::max(frameStart, dequeueTime);
-        mRecorder.frameDequeued(number, slot, contentTime, requestTime, dequeueTime);
-        mHost.onBufferDequeued(slot, requestTime, dequeueTime);
-
-        const android::sp<android::GraphicBuffer>& buffer = mQueue.buffer(slot);
-        draw(*buffer, contentTime);
-        android::sp<android::Fence> fence = android::Fence::createPending();
-        const nsecs_t queueTime = systemTime(SYSTEM_TIME_MONOTONIC);
-        mGpu.signalAt(fence, queueTime + render);
-
-        mQueue.markQueued(slot, number);
-        mRecorder.frameQueued(number, queueTime);
-        mHost.onBufferQueued(number, slot, buffer, queueTime, fence);
-        mQueue.makeAcquirable({slot, number, queueTime, fence});
-
-        nsecs_t interval = std::max(MS, period + toNanos(jitter(random)));
-        if (capture != nullptr) {
-            replayed++;
-            if (replayed == capture->size()) {
-                if (!mConfig.loop) {
-                    mCaptureEnd = queueTime;
-                    break;
-                }
-                replayed = 0;
-                interval = mConfig.capture->meanInterval();
-            } else {
-                interval = (*capture)[replayed].queueTime - (*capture)[replayed - 1].queueTime;
-            }
-        }
-        frameStart = std::max(frameStart + interval, systemTime(SYSTEM_TIME_MONOTONIC));
-        // Held to the game-rate limit, as the controlling service would hold it.
-        const host::LayerHost::Status status = mHost.status();
-        if (status.gameRateLimitApplied) {
-            frameStart = std::max(frameStart, requestTime + SECOND / status.gameRateLimit);
-        }
+        produce(slot, requestTime, now());
     }
     // A finished capture leaves the game idle until the run ends.
     sleepUntil(std::numeric_limits<nsecs_t>::max());
+}
+
+bool Game::tryProduce() {
+    if (mFrameStart < 0) return false;
+    const nsecs_t time = now();
+    if (!mWaitingForBuffer) mRequestTime = time;
+    const int slot = mQueue.tryDequeue();
+    if (slot < 0) {
+        if (!mWaitingForBuffer) mHost.onBufferBackpressure();
+        mWaitingForBuffer = true;
+        return false;
+    }
+    mWaitingForBuffer = false;
+    produce(slot, mRequestTime, time);
+    return true;
+}
+
+void Game::produce(int slot, nsecs_t requestTime, nsecs_t dequeueTime) {
+    const uint64_t number = mNumber++;
+    // Both drawn for every frame, in this order, so that a seed gives the same game whatever
+    // replaces them.
+    nsecs_t render = std::max<nsecs_t>(0, toNanos(mRenderTime(mRandom)));
+    nsecs_t interval = std::max(MS, mPeriod + toNanos(mJitter(mRandom)));
+    const std::vector<CaptureFrame>* capture =
+            mConfig.capture != nullptr ? &mConfig.capture->frames : nullptr;
+    if (capture != nullptr) {
+        const CaptureFrame& frame = (*capture)[mReplayed];
+        if (frame.renderDoneTime >= 0) render = frame.renderDoneTime - frame.queueTime;
+    }
+
+    // A game that had to wait for a buffer simulates its world from when it got one.
+    const nsecs_t contentTime = std::max(mFrameStart, dequeueTime);
+    mRecorder.frameDequeued(number, slot, contentTime, requestTime, dequeueTime);
+    mHost.onBufferDequeued(slot, requestTime, dequeueTime);
+
+    const android::sp<android::GraphicBuffer>& buffer = mQueue.buffer(slot);
+    if (dequeueTime < mConfig.drawUntil) draw(*buffer, contentTime);
+    android::sp<android::Fence> fence = android::Fence::createPending();
+    const nsecs_t queueTime = now();
+    mGpu.signalAt(fence, queueTime + render);
+
+    mQueue.markQueued(slot, number);
+    mRecorder.frameQueued(number, queueTime);
+    mHost.onBufferQueued(number, slot, buffer, queueTime, fence);
+    mQueue.makeAcquirable({slot, number, queueTime, std::move(fence)});
+
+    if (capture != nullptr) {
+        mReplayed++;
+        if (mReplayed == capture->size()) {
+            if (!mConfig.loop) {
+                mCaptureEnd = queueTime;
+                mFrameStart = -1;
+                return;
+            }
+            mReplayed = 0;
+            interval = mConfig.capture->meanInterval();
+        } else {
+            interval = (*capture)[mReplayed].queueTime - (*capture)[mReplayed - 1].queueTime;
+        }
+    }
+    mFrameStart = std::max(mFrameStart + interval, now());
+    // Held to the game-rate limit, as the controlling service would hold it.
+    const host::LayerHost::Status status = mHost.status();
+    if (status.gameRateLimitApplied) {
+        mFrameStart = std::max(mFrameStart, requestTime + SECOND / status.gameRateLimit);
+    }
 }
 
 }  // namespace verolux::sim

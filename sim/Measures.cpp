@@ -94,7 +94,7 @@ void Measures::onRefresh(const RefreshRecord& refresh) {
     }
 
     mPictures[static_cast<size_t>(refresh.picture)]++;
-    mCpu.add(refresh.cpuTime);
+    if (refresh.cpuTime >= 0) mCpu.add(refresh.cpuTime);
     if (mLastIndex && refresh.index > *mLastIndex + 1) {
         mSkippedVsyncs += refresh.index - *mLastIndex - 1;
     }

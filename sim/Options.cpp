@@ -138,6 +138,16 @@ bool applyValueOption(std::string_view name, std::string_view text, Options& opt
         error = applySeed(text, options);
         return true;
     }
+    if (name == "--time") {
+        if (text == "simulated") {
+            options.time = TimeMode::SIMULATED;
+        } else if (text == "real") {
+            options.time = TimeMode::REAL;
+        } else {
+            error = errorLine("--time expects simulated or real (got " + quoted(text) + ")");
+        }
+        return true;
+    }
     if (name == "--set") {
         auto value = parseSettingAssignment(text);
         error = value.error;
@@ -201,10 +211,14 @@ Result<Options> parseOptions(int argc, const char* const* argv) {
     return result;
 }
 
+const char* timeModeName(TimeMode mode) {
+    return mode == TimeMode::REAL ? "real" : "simulated";
+}
+
 std::string usage() {
     std::string text = R"(Usage: verolux-sim [options]
-Plays a simulated game and display in real time against the library, and the same game without
-interpolation (mode 2) beside it, and reports what the screen showed.
+Plays a simulated game and display against the library, and the same game without interpolation
+(mode 2) beside it, and reports what the screen showed.
 
 Game:
   --fps F            frames per second the game queues (default 30, 0.1 to 1000)
@@ -235,6 +249,9 @@ Display and library:
                      is the refresh rate unless set (interpolation is on from 1 upwards);
                      gfpsOffsetEnabled=1 holds the game to the game-rate limit
 Run and output:
+  --time simulated   play every event in simulated time, as fast as the machine can (the
+                     default): the same inputs and seed give the same results, byte for byte
+  --time real        play the game and the display in real time, on threads of their own
   --duration S       seconds to run (default 10, or the capture's length; at most 3600)
   --out DIR          output folder (default sim-out)
   --width W          width of the space-time picture in pixels, 16 to 4096 (default 320)

@@ -9,9 +9,15 @@
 
 namespace verolux::sim {
 
+// How a run keeps time: simulated (one thread plays every event in time order, as fast as it can,
+// and the library's clock reads the time of the event being played) or real (the game, the
+// display and the release threads wait on the real clock).
+enum class TimeMode { SIMULATED, REAL };
+
 // What verolux-sim was asked to do. Without a capture the game is generated: frames at fps with
 // a normally distributed queue-time jitter and render time, from the seed.
 struct Options {
+    TimeMode time = TimeMode::SIMULATED;
     double fps = 30;
     double jitterMs = 1;
     double renderMs = 8;  // mean GPU time of a frame
@@ -42,6 +48,9 @@ struct Options {
 Result<Options> parseOptions(int argc, const char* const* argv);
 
 std::string usage();
+
+// "simulated" or "real".
+const char* timeModeName(TimeMode mode);
 
 // The settings message of a run: the settings file's values, then the --set overrides, so that
 // an override wins when the library applies the entries in order.

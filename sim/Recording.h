@@ -59,7 +59,7 @@ struct RefreshRecord {
     uint8_t itemCount = 0;
     double contentTime = -1;        // game time on screen, weighted over the picture; -1 before any
     nsecs_t delay = -1;             // display delay in force, -1 when there is none
-    nsecs_t cpuTime = 0;            // the library's CPU time for this refresh (thread CPU clock)
+    nsecs_t cpuTime = -1;           // the library's CPU time for this refresh (thread CPU clock)
     uint32_t queueLength = 0;       // frames in the engine's queue after composing
     std::vector<uint8_t> scanline;  // one RGB scanline of the picture; may be empty
 

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <atomic>
+#include <memory>
 #include <ostream>
 #include <string>
 #include <vector>
@@ -12,6 +13,8 @@
 #include "sim/Recording.h"
 
 namespace verolux::sim {
+
+class Compositor;
 
 // A simulated layer as planned: the game in the chosen mode, the same game in mode 2 beside it,
 // or another copy of the game in the chosen mode.
@@ -27,15 +30,30 @@ struct RunResult {
     nsecs_t endTime = -1;
     bool interrupted = false;
     bool captureEnded = false;
-    std::string dump;  // every layer's dump at the end of the run, before tear-down
+    double wallSeconds = 0;  // how long the run took on the wall clock
+    // Every layer's dump at the end of the run, before tear-down; in simulated time with its
+    // object addresses written as "(address)".
+    std::string dump;
     // Every layer's ring log as its parcel carries it, one after the other, read at the same time.
     std::vector<uint8_t> ringLogs;
 };
 
-// One run of verolux-sim in real time: the game and, unless left out, the same game (same seed
-// or capture) in mode 2 beside it, then the game's further copies (--layers), on one display,
-// each through the reference host. The records of each layer go to its sink from the calling
-// thread, between the real-time threads' work.
+// One run of verolux-sim: the game and, unless left out, the same game (same seed or capture) in
+// mode 2 beside it, then the game's further copies (--layers), on one display, each through the
+// reference host. The records of each layer go to its sink from the calling thread.
+//
+// In real time the game, the display, the GPU and each layer's release side run on threads of
+// their own, and the calling thread hands the records on between their work. In simulated time
+// the calling thread plays every event in time order (a frame's start, its rendering done, a
+// vsync and its composition, a release decision, a reading of the warnings) with the process's
+// clock (ClockOverride) set to each event's time, from SIMULATED_CLOCK_START on; no thread is
+// started and nothing waits. Layers release through LayerHost::stepRelease(), the same decisions
+// as the release thread's.
+//
+// Several runs may follow one another in one process, each as if it were the first: a run resets
+// the library's process-wide state that it would otherwise inherit from the one before (its uids'
+// settings and warnings, the process-wide tunables). Simulated runs cannot overlap: the clock is
+// the process's.
 class Simulation {
 public:
     static constexpr uint32_t GAME_UID = 10'001;
@@ -45,6 +63,11 @@ public:
     static constexpr uint32_t BUFFER_HEIGHT = 4;
     // After the capture's last frame, long enough for it to reach the screen.
     static constexpr nsecs_t CAPTURE_TAIL = 250'000'000;
+    // The monotonic clock when a simulated run begins, and the wall clock (ms since the epoch) at
+    // its startTime(): midnight UTC, 1 January 2024, so that a warning's time of day is its time
+    // in the run.
+    static constexpr nsecs_t SIMULATED_CLOCK_START = 100'000'000'000;
+    static constexpr int64_t SIMULATED_WALL_CLOCK_AT_START_MS = 1'704'067'200'000;
 
     // Delivers the settings to the layers' uids and plans the layers; the run starts a moment
     // later, at startTime(). Unless the settings set gameFpsLimit, it is the refresh rate, so that
@@ -59,13 +82,27 @@ public:
     nsecs_t initialDelay() const { return mInitialDelay; }
 
     // Runs until the duration has passed, the capture has ended or `interrupted` is set; sinks
-    // holds one per layer. Progress lines go to `progress` when it is not null. As the settings
+    // holds one per layer. Progress lines go to `progress` when it is not null: every second of
+    // the run in real time, every second of wall-clock time in simulated time. As the settings
     // client does, it reads each layer's watchdog warnings back as they come and hands them to
-    // the layer's sink.
+    // the layer's sink. Call it once.
     RunResult run(const std::vector<RecordSink*>& sinks, const std::atomic<bool>& interrupted,
                   std::ostream* progress);
 
 private:
+    struct Layer;
+    class SimulatedTimeLoop;
+
+    // The end of a run of the given duration, or the largest time when it lasts until the
+    // capture ends.
+    nsecs_t plannedEnd() const;
+    double plannedSeconds() const;
+    // The game, the display and the release sides on threads, until the run is over.
+    void runInRealTime(std::vector<std::unique_ptr<Layer>>& layers, Compositor& compositor,
+                       const std::vector<RecordSink*>& sinks, const std::atomic<bool>& interrupted,
+                       std::ostream* progress, RunResult& result);
+    void readWarnings(Layer& layer);
+
     const Options mOptions;
     const Capture* const mCapture;
     const nsecs_t mRefreshPeriod;

@@ -208,10 +208,12 @@ const Line LINES[] = {
         {"buffers", buffers},
         {"display delay start / end", [](const Summary& s) { return delay(s.measured); }},
         {"library CPU per refresh mean / p99",
-         [](const Summary& s) {
+         [](const Summary& s) -> std::string {
+             if (s.facts.time == TimeMode::SIMULATED) return "not measured in simulated time";
              return values({s.measured.cpuMeanUs, s.measured.cpuP99Us}, "us", "%.1f");
          }},
         {"Run", nullptr},
+        {"time", [](const Summary& s) -> std::string { return timeModeName(s.facts.time); }},
         {"run length", [](const Summary& s) { return format("%.2f s", s.facts.runSec); }},
         {"interpolation", interpolation},
         {"refreshes",

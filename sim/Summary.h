@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "sim/Measures.h"
+#include "sim/Options.h"
 
 namespace verolux::sim {
 
@@ -15,13 +16,14 @@ struct LayerFacts {
     uint32_t mode = 0;
     double runSec = 0;
     uint32_t buffers = 0;
-    bool buffersFixed = false;     // by --slots or queueSize rather than sized for the delay
-    uint64_t bufferBytes = 0;      // all the layer's buffers at the game's resolution
-    std::string resolution;        // "1920x1080"
-    std::optional<double> ownFps;  // the rate the game runs at on its own
-    double refreshHz = 0;          // the display's true refresh rate
-    nsecs_t startTime = 0;         // stutter times count from here
-    bool captureEnded = false;     // the run stopped because its capture ran out
+    bool buffersFixed = false;            // by --slots or queueSize rather than sized for the delay
+    uint64_t bufferBytes = 0;             // all the layer's buffers at the game's resolution
+    std::string resolution;               // "1920x1080"
+    std::optional<double> ownFps;         // the rate the game runs at on its own
+    double refreshHz = 0;                 // the display's true refresh rate
+    nsecs_t startTime = 0;                // stutter times count from here
+    bool captureEnded = false;            // the run stopped because its capture ran out
+    TimeMode time = TimeMode::SIMULATED;  // how the run kept time
 };
 
 struct Summary {

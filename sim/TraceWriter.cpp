@@ -6,6 +6,7 @@
 #include <cstdarg>
 #include <cstdio>
 
+#include "sim/TextLine.h"
 #include "sim/WarningLedger.h"
 
 namespace verolux::sim {
@@ -56,13 +57,10 @@ public:
     void onDelayChange(nsecs_t time, nsecs_t delay) override {
         counter("display delay", time, "ms", static_cast<double>(delay) / 1e6);
     }
+    void onWarning(const WarningRecord& warning) override;
 
+    // Metadata, written seldom: printf-style.
     void emit(const char* format, ...) __attribute__((format(printf, 2, 3)));
-    double us(nsecs_t time) const { return static_cast<double>(time - mWriter.mOrigin) / 1e3; }
-    void counter(const char* name, nsecs_t time, const char* unit, double value) {
-        emit("{\"ph\":\"C\",\"name\":\"%s\",\"pid\":%d,\"ts\":%.3f,\"args\":{\"%s\":%.3f}}", name,
-             mPid, us(time), unit, value);
-    }
     void nameThread(int tid, const std::string& name) {
         emit("{\"ph\":\"M\",\"name\":\"thread_name\",\"pid\":%d,\"tid\":%d,\"args\":{\"name\":%s}}",
              mPid, tid, compactJson(name).c_str());
@@ -71,11 +69,52 @@ public:
              mPid, tid, tid);
     }
 
+private:
+    // The start of an event: {"ph":"X","name":"<name>" and the category, process and thread.
+    TextLine& begin(char phase, std::string_view name, const char* category, int tid) {
+        mLine << "{\"ph\":\"" << phase << "\",\"name\":\"" << name << '"';
+        if (category != nullptr) mLine << ",\"cat\":\"" << category << '"';
+        mLine << ",\"pid\":" << mPid;
+        if (tid >= 0) mLine << ",\"tid\":" << tid;
+        return mLine;
+    }
+    // A time in microseconds from the start of the run, and a duration in microseconds, with
+    // three places.
+    TextLine& ts(nsecs_t time) {
+        return mLine << ",\"ts\":" << ThousandthsOf{time - mWriter.mOrigin};
+    }
+    TextLine& dur(nsecs_t duration) { return mLine << ",\"dur\":" << ThousandthsOf{duration}; }
+    void end() {
+        mLine << '}';
+        mWriter.mOut << ",\n";
+        mLine.writeTo(mWriter.mOut);
+    }
+    void counter(const char* name, nsecs_t time, const char* unit, double value) {
+        begin('C', name, nullptr, -1);
+        ts(time);
+        mLine << ",\"args\":{\"" << unit << "\":";
+        mLine.fixed(value, 3);
+        mLine << '}';
+        end();
+    }
+    void frameInstant(const char* name, int tid, nsecs_t time, uint64_t frame) {
+        begin('i', name, "frame", tid) << ",\"s\":\"t\"";
+        ts(time) << ",\"args\":{\"frame\":" << frame << '}';
+        end();
+    }
+
+    struct ThousandthsOf {
+        int64_t value;
+    };
+    friend TextLine& operator<<(TextLine& line, ThousandthsOf t) {
+        return line.thousandths(t.value);
+    }
+
     TraceWriter& mWriter;
     const int mPid;
     const nsecs_t mRefreshPeriod;
     uint64_t mNamedSlots = 0;  // bit per slot below 64 already named
-    void onWarning(const WarningRecord& warning) override;
+    TextLine mLine;
 
     PerSecond mGameFps;
     PerSecond mDisplayedFps;
@@ -95,28 +134,25 @@ void TraceWriter::LayerTrace::emit(const char* format, ...) {
 }
 
 void TraceWriter::LayerTrace::onRefresh(const RefreshRecord& refresh) {
-    std::string frames, alphas, weights;
-    for (uint8_t i = 0; i < refresh.itemCount; i++) {
-        const char* comma = i == 0 ? "" : ",";
-        char item[96];
-        snprintf(item, sizeof(item), "%s%" PRIu64, comma, refresh.items[i].frameNumber);
-        frames += item;
-        snprintf(item, sizeof(item), "%s%.4g", comma, refresh.items[i].alpha);
-        alphas += item;
-        snprintf(item, sizeof(item), "%s%.4g", comma, refresh.items[i].weight);
-        weights += item;
-    }
-    char content[48] = "null";
+    begin('X', pictureName(refresh.picture), "display", DISPLAY_TID);
+    ts(refresh.presentTime);
+    dur(mRefreshPeriod) << ",\"args\":{\"refresh\":" << refresh.index << ",\"frames\":[";
+    for (uint8_t i = 0; i < refresh.itemCount; i++)
+        (i == 0 ? mLine : mLine << ',') << refresh.items[i].frameNumber;
+    mLine << "],\"alphas\":[";
+    for (uint8_t i = 0; i < refresh.itemCount; i++)
+        (i == 0 ? mLine : mLine << ',').general(refresh.items[i].alpha, 4);
+    mLine << "],\"weights\":[";
+    for (uint8_t i = 0; i < refresh.itemCount; i++)
+        (i == 0 ? mLine : mLine << ',').general(refresh.items[i].weight, 4);
+    mLine << "],\"content_ms\":";
     if (refresh.contentTime >= 0) {
-        snprintf(content, sizeof(content), "%.3f",
-                 (refresh.contentTime - static_cast<double>(mWriter.mOrigin)) / 1e6);
+        mLine.fixed((refresh.contentTime - static_cast<double>(mWriter.mOrigin)) / 1e6, 3);
+    } else {
+        mLine << "null";
     }
-    emit("{\"ph\":\"X\",\"name\":\"%s\",\"cat\":\"display\",\"pid\":%d,\"tid\":%d,\"ts\":%.3f,"
-         "\"dur\":%.3f,\"args\":{\"refresh\":%" PRIu64
-         ",\"frames\":[%s],\"alphas\":[%s],\"weights\":[%s],\"content_ms\":%s}}",
-         pictureName(refresh.picture), mPid, DISPLAY_TID, us(refresh.presentTime),
-         static_cast<double>(mRefreshPeriod) / 1e3, refresh.index, frames.c_str(), alphas.c_str(),
-         weights.c_str(), content);
+    mLine << '}';
+    end();
     counter("queue length", refresh.vsyncTime, "frames", refresh.queueLength);
     if (refresh.contentTime >= 0) {
         counter("content age", refresh.presentTime, "ms",
@@ -132,9 +168,9 @@ void TraceWriter::LayerTrace::onRefresh(const RefreshRecord& refresh) {
         counter("game-rate limit", refresh.vsyncTime, "fps", limit);
     }
     if (refresh.refused) {
-        emit("{\"ph\":\"i\",\"s\":\"t\",\"name\":\"refused presentation\",\"cat\":\"display\","
-             "\"pid\":%d,\"tid\":%d,\"ts\":%.3f,\"args\":{\"refresh\":%" PRIu64 "}}",
-             mPid, DISPLAY_TID, us(refresh.vsyncTime), refresh.index);
+        begin('i', "refused presentation", "display", DISPLAY_TID) << ",\"s\":\"t\"";
+        ts(refresh.vsyncTime) << ",\"args\":{\"refresh\":" << refresh.index << '}';
+        end();
     } else {
         mRenderRate.add(refresh.vsyncTime, mWriter.mOrigin, [this](nsecs_t end, uint64_t n) {
             counter("render rate", end, "fps", static_cast<double>(n));
@@ -148,24 +184,25 @@ void TraceWriter::LayerTrace::onRefresh(const RefreshRecord& refresh) {
 }
 
 void TraceWriter::LayerTrace::onWarning(const WarningRecord& warning) {
-    emit("{\"ph\":\"i\",\"s\":\"p\",\"name\":\"watchdog warning\",\"cat\":\"watchdog\","
-         "\"pid\":%d,\"tid\":%d,\"ts\":%.3f,\"args\":{\"code\":\"%s\",\"value\":%g}}",
-         mPid, DISPLAY_TID, us(warning.time), warningCodeName(warning.code).c_str(), warning.value);
+    begin('i', "watchdog warning", "watchdog", DISPLAY_TID) << ",\"s\":\"p\"";
+    ts(warning.time) << ",\"args\":{\"code\":\"" << warningCodeName(warning.code) << "\",\"value\":";
+    mLine.general(warning.value, 6) << '}';
+    end();
 }
 
 void TraceWriter::LayerTrace::onFrame(const FrameRecord& frame) {
     if (frame.startTime >= 0 && frame.dequeueTime > frame.startTime) {
-        emit("{\"ph\":\"X\",\"name\":\"wait for buffer\",\"cat\":\"game\",\"pid\":%d,\"tid\":%d,"
-             "\"ts\":%.3f,\"dur\":%.3f,\"args\":{\"frame\":%" PRIu64 "}}",
-             mPid, GAME_TID, us(frame.startTime), us(frame.dequeueTime) - us(frame.startTime),
-             frame.number);
+        begin('X', "wait for buffer", "game", GAME_TID);
+        ts(frame.startTime);
+        dur(frame.dequeueTime - frame.startTime) << ",\"args\":{\"frame\":" << frame.number << '}';
+        end();
     }
     if (frame.queueTime < 0) return;
     if (frame.dequeueTime >= 0) {
-        emit("{\"ph\":\"X\",\"name\":\"draw\",\"cat\":\"game\",\"pid\":%d,\"tid\":%d,\"ts\":%.3f,"
-             "\"dur\":%.3f,\"args\":{\"frame\":%" PRIu64 "}}",
-             mPid, GAME_TID, us(frame.dequeueTime), us(frame.queueTime) - us(frame.dequeueTime),
-             frame.number);
+        begin('X', "draw", "game", GAME_TID);
+        ts(frame.dequeueTime);
+        dur(frame.queueTime - frame.dequeueTime) << ",\"args\":{\"frame\":" << frame.number << '}';
+        end();
     }
     const bool known = frame.slot >= 0 && frame.slot < 64;
     const int tid = known ? FIRST_SLOT_TID + frame.slot : UNKNOWN_SLOT_TID;
@@ -174,25 +211,24 @@ void TraceWriter::LayerTrace::onFrame(const FrameRecord& frame) {
         mNamedSlots |= uint64_t{1} << (known ? frame.slot : 63);
     }
     const nsecs_t end = frame.releaseTime >= frame.queueTime ? frame.releaseTime : frame.queueTime;
-    char latency[32] = "null";
-    if (!frame.dropped()) {
-        snprintf(latency, sizeof(latency), "%.3f",
-                 static_cast<double>(frame.firstPresentTime - frame.queueTime) / 1e6);
+    mLine << "{\"ph\":\"X\",\"name\":\"frame " << frame.number
+          << "\",\"cat\":\"frame\",\"pid\":" << mPid << ",\"tid\":" << tid;
+    ts(frame.queueTime);
+    dur(end - frame.queueTime) << ",\"args\":{\"frame\":" << frame.number
+                               << ",\"dropped\":" << (frame.dropped() ? "true" : "false")
+                               << ",\"latency_ms\":";
+    if (frame.dropped()) {
+        mLine << "null";
+    } else {
+        mLine.fixed(static_cast<double>(frame.firstPresentTime - frame.queueTime) / 1e6, 3);
     }
-    emit("{\"ph\":\"X\",\"name\":\"frame %" PRIu64
-         "\",\"cat\":\"frame\",\"pid\":%d,\"tid\":%d,"
-         "\"ts\":%.3f,\"dur\":%.3f,\"args\":{\"frame\":%" PRIu64
-         ",\"dropped\":%s,\"latency_ms\":%s}}",
-         frame.number, mPid, tid, us(frame.queueTime), us(end) - us(frame.queueTime), frame.number,
-         frame.dropped() ? "true" : "false", latency);
-    const std::pair<const char*, nsecs_t> steps[] = {{"render done", frame.renderDoneTime},
-                                                     {"acquire", frame.acquireTime},
-                                                     {"first present", frame.firstPresentTime}};
-    for (const auto& [name, time] : steps) {
-        if (time < 0) continue;
-        emit("{\"ph\":\"i\",\"s\":\"t\",\"name\":\"%s\",\"cat\":\"frame\",\"pid\":%d,\"tid\":%d,"
-             "\"ts\":%.3f,\"args\":{\"frame\":%" PRIu64 "}}",
-             name, mPid, tid, us(time), frame.number);
+    mLine << '}';
+    this->end();
+    if (frame.renderDoneTime >= 0)
+        frameInstant("render done", tid, frame.renderDoneTime, frame.number);
+    if (frame.acquireTime >= 0) frameInstant("acquire", tid, frame.acquireTime, frame.number);
+    if (frame.firstPresentTime >= 0) {
+        frameInstant("first present", tid, frame.firstPresentTime, frame.number);
     }
     mGameFps.add(frame.queueTime, mWriter.mOrigin, [this](nsecs_t end, uint64_t n) {
         counter("game fps", end, "fps", static_cast<double>(n));

@@ -65,6 +65,7 @@ INSTANTIATE_TEST_SUITE_P(AllModes, SimulationTest, testing::Range(0u, 6u));
 // The reference and a further copy of the game, each a layer of its own beside the run.
 TEST(SimulationInterruptTest, stopsEarlyAndKeepsWhatEveryLayerRecorded) {
     Options options = shortRun(0);
+    options.time = TimeMode::REAL;
     options.durationSec = 30;
     options.reference = true;
     options.layers = 2;
