@@ -119,6 +119,7 @@ void Compositor::refreshLayer(size_t layerIndex, uint64_t index, nsecs_t vsync, 
                                   clientComposed ? host::LayerHost::CompositionType::CLIENT
                                                  : host::LayerHost::CompositionType::DEVICE);
     if (measureCpu) record.cpuTime = (cpuComposed - cpuBefore) + (threadCpuTime() - cpuReturning);
+    if (mAfterComposition) mAfterComposition(layerIndex);
     record.queueLength = static_cast<uint32_t>(layer.host->frameList()->size());
     if (pixels) record.scanline = screen.scanline;
     const host::LayerHost::Status status = layer.host->status();

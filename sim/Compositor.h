@@ -2,6 +2,7 @@
 
 #include <atomic>
 #include <condition_variable>
+#include <functional>
 #include <limits>
 #include <mutex>
 #include <random>
@@ -57,6 +58,12 @@ public:
     void stop();
     // Composes every layer at `vsync`, a whole number of periods after the first.
     void refresh(nsecs_t vsync);
+    // Simulated time: called with the layer's index once a layer's composition is done, before its
+    // refresh is recorded. On threads, the release side acts on a composition at once, while the
+    // display records the refresh; a simulation lets it act here.
+    void setAfterComposition(std::function<void(size_t layer)> afterComposition) {
+        mAfterComposition = std::move(afterComposition);
+    }
 
 private:
     struct Screen {
@@ -79,6 +86,7 @@ private:
     std::mt19937_64 mRandom;          // display thread only
     std::uniform_real_distribution<double> mClientDraw{0.0, 1.0};
     const android::Interpolation::RenderState mNothing;  // what a layer that does not present composes
+    std::function<void(size_t)> mAfterComposition;
 
     std::mutex mMutex;
     std::condition_variable mStopped;

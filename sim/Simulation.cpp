@@ -136,7 +136,9 @@ struct Simulation::Layer {
 // Plays a run's events in time order on the calling thread, the process's clock at each event's
 // time. After each event it lets every layer's release side decide again when an event it
 // decides on came while it waited, and every game that waits for a buffer try again, until
-// neither has anything to do: on threads, both would wake at once.
+// neither has anything to do: on threads, both would wake at once. A layer's release side also
+// decides right after the layer's composition, before the display records the refresh, as the
+// release thread, woken by the composition, does while the display goes on.
 class Simulation::SimulatedTimeLoop final : public FenceScheduler {
 public:
     struct Event {
@@ -180,6 +182,8 @@ private:
     void push(nsecs_t time, Event event) { mEvents.push(std::max(time, mNow), std::move(event)); }
     void play(Event& event, Compositor& compositor);
     void settle();
+    // Lets the layer's release side decide again when it waits and an event it decides on came.
+    bool decideIfWoken(size_t layer);
     void decideReleases(size_t layer);
     void scheduleNextFrame(size_t layer);
     // The end of the run as far as known: the duration's, or the end of the capture's tail once
@@ -206,6 +210,7 @@ void Simulation::SimulatedTimeLoop::run(Compositor& compositor, const std::atomi
         decideReleases(i);
         push(mLayers[i]->game->nextFrameStart(), Event(Event::Kind::FRAME_START, i));
     }
+    compositor.setAfterComposition([this](size_t layer) { decideIfWoken(layer); });
     push(start, Event(Event::Kind::VSYNC));
     push(start + DRAIN_PERIOD, Event(Event::Kind::READ_WARNINGS));
 
@@ -267,14 +272,7 @@ void Simulation::SimulatedTimeLoop::settle() {
     for (int round = 0; round < MAX_SETTLING_ROUNDS; round++) {
         bool acted = false;
         for (size_t i = 0; i < mLayers.size(); i++) {
-            const ReleaseSide& side = mRelease[i];
-            host::LayerHost& host = *mLayers[i]->layerHost;
-            const bool waitsForEvents =
-                    side.waiting == Next::WAIT_FOR_EVENT || side.waiting == Next::WAIT_UNTIL;
-            if (waitsForEvents && host.releaseEvents() != side.eventsSeen) {
-                decideReleases(i);
-                acted = true;
-            }
+            acted |= decideIfWoken(i);
             Game& game = *mLayers[i]->game;
             if (game.waitingForBuffer() && game.tryProduce()) {
                 scheduleNextFrame(i);
@@ -285,6 +283,17 @@ void Simulation::SimulatedTimeLoop::settle() {
     }
 }
 
+bool Simulation::SimulatedTimeLoop::decideIfWoken(size_t layer) {
+    const ReleaseSide& side = mRelease[layer];
+    const bool waitsForEvents =
+            side.waiting == Next::WAIT_FOR_EVENT || side.waiting == Next::WAIT_UNTIL;
+    if (!waitsForEvents || mLayers[layer]->layerHost->releaseEvents() == side.eventsSeen) {
+        return false;
+    }
+    decideReleases(layer);
+    return true;
+}
+
 void Simulation::SimulatedTimeLoop::decideReleases(size_t layer) {
     host::LayerHost& host = *mLayers[layer]->layerHost;
     host::LayerHost::ReleaseStep step{Next::WAIT_FOR_EVENT,
@@ -292,6 +301,11 @@ void Simulation::SimulatedTimeLoop::decideReleases(size_t layer) {
     for (int decisions = 0; decisions < MAX_DECISIONS_AT_ONCE; decisions++) {
         const host::LayerHost::ReleaseStep next = host.stepRelease();
         if (next.next == Next::DECIDE) continue;
+        // A sleep of nothing returns at once on a thread too.
+        if (next.next == Next::SLEEP_UNTIL && next.until <= mNow) {
+            host.finishSleepingRelease();
+            continue;
+        }
         step = next;
         break;
     }
