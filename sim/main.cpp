@@ -74,14 +74,17 @@ int main(int argc, char** argv) {
     };
     for (const std::string& error : run.errors)
         check(Status{error});
-    if (run.result.interrupted) std::cout << "Interrupted: results cover the run so far.\n";
-    std::cout << run.summaryText << std::flush;
+    if (run.result.interrupted && !options.quiet) {
+        std::cout << "Interrupted: results cover the run so far.\n";
+    }
+    if (!options.quiet) std::cout << run.summaryText << std::flush;
 
     if (!options.quiet) std::cerr << "verolux-sim: drawing the figures..." << std::endl;
     const Status drawn = drawFigures(options.outDir);
     if (!drawn.ok()) std::cerr << drawn.error << std::endl;
     check(writeReport(options.outDir, run.described, run.run(), run.reference()));
 
+    if (options.quiet) return status;
     rusage usage{};
     getrusage(RUSAGE_SELF, &usage);
     std::cout << "\nIn " << options.outDir << ":\n"
