@@ -12,9 +12,27 @@ using Interpolation::EventDispatcher;
 using Interpolation::EventType;
 using Interpolation::UniqueLock;
 
-void FrameList::FrameDeque::insert(const_iterator position, const FrameItem& frame) {
-    mFrames.insert(position, frame);
-    broadcastEvent<Interpolation::eFrameReceivedEvent>(frame);
+namespace {
+
+// Enough for the frames a layer queues at the longest display delay and the highest frame rate;
+// a deeper queue grows the storage once.
+constexpr size_t RESERVED_FRAMES = 32;
+
+// A removed frame as the removals return it: alone if it was valid, else nothing.
+std::vector<FrameItem> validOnly(FrameItem removed) {
+    std::vector<FrameItem> frames;
+    if (removed.isValid()) frames.push_back(std::move(removed));
+    return frames;
+}
+
+}  // namespace
+
+FrameList::FrameDeque::FrameDeque(uint32_t uid) : mUid(uid) {
+    mFrames.reserve(RESERVED_FRAMES);
+}
+
+void FrameList::FrameDeque::insert(const_iterator position, FrameItem frame) {
+    broadcastEvent<Interpolation::eFrameReceivedEvent>(*mFrames.insert(position, std::move(frame)));
 }
 
 FrameItem FrameList::FrameDeque::erase(const_iterator position) {
@@ -26,13 +44,18 @@ FrameItem FrameList::FrameDeque::erase(const_iterator position) {
 }
 
 template <EventType type>
-void FrameList::FrameDeque::broadcastEvent(const FrameItem& frame) {
+void FrameList::FrameDeque::broadcastEvent(FrameItem& frame) {
     static_assert(type == Interpolation::eFrameReceivedEvent ||
                   type == Interpolation::eFrameReleasedEvent);
     const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
     const int size = static_cast<int>(mFrames.size());
     const int sizeBefore = type == Interpolation::eFrameReceivedEvent ? size - 1 : size + 1;
-    EventDispatcher::broadcastEvent(mUid, type, now, frame);
+    // Receivers get the frame by reference and copy what they keep, and none can reach the list
+    // meanwhile (its mutex is held), so the frame itself is lent to the event: no references are
+    // taken and dropped for it.
+    Interpolation::EventData data(std::move(frame));
+    EventDispatcher::broadcastEvent(mUid, type, now, data);
+    frame = std::move(std::get<FrameItem>(data));
     EventDispatcher::broadcastEvent(mUid, Interpolation::eFrameListSizeChangedEvent, now - 1,
                                     sizeBefore);
     EventDispatcher::broadcastEvent(mUid, Interpolation::eFrameListSizeChangedEvent, now, size);
@@ -46,21 +69,26 @@ FrameList::FrameList(uint32_t uid) : mFrames(uid) {
 void FrameList::insertFrame(FrameItem frame) {
     std::lock_guard lock(mMutex);
     ILOG(2, "Interpolation::FrameList insertFrame frame %lu", frame.mID);
+    // One walk finds both a queued copy of the frame and, behind frames of equal mID so that they
+    // keep their order of arrival, the place of a new one.
+    size_t position = mFrames.size();
     for (size_t i = 0; i < mFrames.size(); i++) {
-        if (mFrames[i].mTimestamp == frame.mTimestamp) {
+        const FrameItem& queued = mFrames[i];
+        if (queued.mTimestamp == frame.mTimestamp) {
             ILOG(2, "Interpolation::FrameList attempted to insert duplicate frame %lu", frame.mID);
             mFrames[i].update(frame);
             return;
         }
+        if (position == mFrames.size() && queued.mID > frame.mID) position = i;
     }
-    insertFrameLocked(frame);
+    mFrames.insert(mFrames.begin() + static_cast<ptrdiff_t>(position), std::move(frame));
 }
 
-void FrameList::insertFrameLocked(const FrameItem& frame) {
+void FrameList::insertFrameLocked(FrameItem frame) {
     // Behind frames of equal mID, so that they keep their order of arrival.
     auto position = std::find_if(mFrames.begin(), mFrames.end(),
                                  [&](const FrameItem& queued) { return queued.mID > frame.mID; });
-    mFrames.insert(position, frame);
+    mFrames.insert(position, std::move(frame));
 }
 
 void FrameList::replaceFrame(FrameItem out, FrameItem in) {
@@ -74,7 +102,7 @@ void FrameList::replaceFrame(FrameItem out, FrameItem in) {
         return;
     }
     mFrames.erase(found);
-    insertFrameLocked(in);
+    insertFrameLocked(std::move(in));
 }
 
 bool FrameList::hasFrameLocked(const FrameItem& frame) const {
@@ -269,18 +297,14 @@ FrameItem FrameList::clearOldestFrameLockedLocking(std::unique_lock<std::mutex>&
 std::vector<FrameItem> FrameList::clearOldestFrameLocking() {
     Interpolation::ScopedTrace trace("clearOldestFrameLocking");
     UniqueLock<std::mutex> lock(mMutex);
-    FrameItem removed = clearOldestFrameLockedLocking(lock);
-    if (!removed.isValid()) return {};
-    return {std::move(removed)};
+    return validOnly(clearOldestFrameLockedLocking(lock));
 }
 
 std::vector<FrameItem> FrameList::clearOldestFrameIfUnusedLocking(const nsecs_t& t) {
     Interpolation::ScopedTrace trace("clearOldestFrameIfUnusedLocking");
     UniqueLock<std::mutex> lock(mMutex);
     if (!isOldestFrameUnusedLocked(t)) return {};
-    FrameItem removed = clearOldestFrameLockedLocking(lock);
-    if (!removed.isValid()) return {};
-    return {std::move(removed)};
+    return validOnly(clearOldestFrameLockedLocking(lock));
 }
 
 FrameItem FrameList::clearFrameAtLocking(const nsecs_t& t) {
@@ -294,6 +318,8 @@ FrameItem FrameList::clearFrameAtLocking(const nsecs_t& t) {
         });
         if (found != mFrames.end()) mFrames.erase(found);
     }
+    // Without a wait the front cannot change, and the frame taken out is the result itself.
+    if (!isLockedLocked(mFrames.front().mID)) return mFrames.pop_front();
     return frame;
 }
 

@@ -6,7 +6,6 @@
 
 #include <condition_variable>
 #include <cstdint>
-#include <deque>
 #include <mutex>
 #include <vector>
 
@@ -25,13 +24,15 @@ namespace android {
 // 0 is never an index.
 class FrameList : public virtual RefBase {
 public:
-    // The frames, oldest first, announcing each insertion and removal for the layer's uid.
+    // The frames, oldest first, announcing each insertion and removal for the layer's uid. The
+    // queue is short and mostly walked, so it lies in one contiguous array; its storage is reserved
+    // and only ever grows, so that frames pass through it without allocations.
     class FrameDeque {
     public:
-        using iterator = std::deque<FrameItem>::iterator;
-        using const_iterator = std::deque<FrameItem>::const_iterator;
+        using iterator = std::vector<FrameItem>::iterator;
+        using const_iterator = std::vector<FrameItem>::const_iterator;
 
-        explicit FrameDeque(uint32_t uid) : mUid(uid) {}
+        explicit FrameDeque(uint32_t uid);
 
         size_t size() const { return mFrames.size(); }
         bool empty() const { return mFrames.empty(); }
@@ -44,18 +45,18 @@ public:
         const_iterator begin() const { return mFrames.begin(); }
         const_iterator end() const { return mFrames.end(); }
 
-        void insert(const_iterator position, const FrameItem& frame);
+        void insert(const_iterator position, FrameItem frame);
         FrameItem erase(const_iterator position);
         FrameItem pop_front() { return erase(mFrames.begin()); }
 
         // Type 1: the frame arrived; type 2: it left. Each is followed by the size before (at
-        // now - 1) and after (at now).
+        // now - 1) and after (at now). The frame is lent to the event and handed back.
         template <Interpolation::EventType type>
-        void broadcastEvent(const FrameItem& frame);
+        void broadcastEvent(FrameItem& frame);
 
     private:
         uint32_t mUid;
-        std::deque<FrameItem> mFrames;
+        std::vector<FrameItem> mFrames;
     };
 
     explicit FrameList(uint32_t uid);
@@ -110,7 +111,7 @@ private:
     void lockLocked(const FrameItem& frame);
     bool hasFrameAtLocked(nsecs_t t) const;
     FrameItem getFrameAtLocked(nsecs_t t) const;
-    void insertFrameLocked(const FrameItem& frame);
+    void insertFrameLocked(FrameItem frame);
     void waitWhileLockedLocked(nsecs_t id, std::unique_lock<std::mutex>& lock);
 
     mutable std::mutex mMutex;
