@@ -147,22 +147,33 @@ FrameItem FrameList::getFrameAt(const nsecs_t& t) {
     return getFrameAtLocked(t);
 }
 
-FrameItem FrameList::getFrameAt(const nsecs_t& t, int index) {
+FrameItem* FrameList::frameAtLocked(nsecs_t t, int index, bool& valid) {
+    valid = false;
     if (index == 0) {
         ILOG(1, "FrameList received an invalid index");
-        return FrameItem();
+        return nullptr;
     }
     if (mFrames.empty()) {
         ILOG(1, "FrameList is empty");
-        return FrameItem();
+        return nullptr;
     }
     // An oldest frame that is not valid yet counts as index 0, so that negative indices find
     // nothing until it is ready.
-    const int64_t oldestIndex = getIndexForFrame(t, mFrames.front());
+    FrameItem& oldest = mFrames.front();
+    const bool oldestValid = oldest.pollValid();
+    const int64_t oldestIndex = indexOfFrameLocked(t, oldest, oldestValid);
     int64_t position = int64_t{index} - oldestIndex;
     if (index > 0 && oldestIndex < 0) position -= 1;  // the gap at index 0
-    if (position < 0 || position >= static_cast<int64_t>(mFrames.size())) return FrameItem();
-    return mFrames[static_cast<size_t>(position)];
+    if (position < 0 || position >= static_cast<int64_t>(mFrames.size())) return nullptr;
+    FrameItem& found = mFrames[static_cast<size_t>(position)];
+    valid = position == 0 ? oldestValid : found.pollValid();
+    return &found;
+}
+
+FrameItem FrameList::getFrameAt(const nsecs_t& t, int index) {
+    bool valid;
+    const FrameItem* found = frameAtLocked(t, index, valid);
+    return found != nullptr ? *found : FrameItem();
 }
 
 FrameItem FrameList::getFrameBefore(const nsecs_t& t) {
@@ -175,6 +186,22 @@ FrameItem FrameList::getFrameAfter(const nsecs_t& t) {
     return getFrameAt(t, 1);
 }
 
+FrameList::Neighbours FrameList::getNeighbours(const nsecs_t& t) {
+    std::lock_guard lock(mMutex);
+    return neighboursLocked(t);
+}
+
+FrameList::Neighbours FrameList::neighboursLocked(nsecs_t t) {
+    Neighbours neighbours;
+    if (const FrameItem* before = frameAtLocked(t, -1, neighbours.beforeValid)) {
+        neighbours.beforeID = before->mID;
+    }
+    if (const FrameItem* after = frameAtLocked(t, 1, neighbours.afterValid)) {
+        neighbours.afterID = after->mID;
+    }
+    return neighbours;
+}
+
 bool FrameList::isLockedLocked(nsecs_t id) const {
     return std::binary_search(mLocks.begin(), mLocks.end(), id);
 }
@@ -184,18 +211,25 @@ void FrameList::lockLocked(const FrameItem& frame) {
     if (position == mLocks.end() || *position != frame.mID) mLocks.insert(position, frame.mID);
 }
 
+FrameList::NeighbourPick::NeighbourPick(FrameList& list, nsecs_t t)
+    : mList(list), mLock(list.mMutex), mTime(t), mNeighbours(list.neighboursLocked(t)) {}
+
 FrameItem FrameList::getFrameBeforeAndLock(const nsecs_t& t) {
     std::lock_guard lock(mMutex);
-    FrameItem frame = getFrameAt(t, -1);
-    if (mLockingEnabled && frame.isValid()) lockLocked(frame);
-    return frame;
+    return copyLockingIfValidLocked(t, -1);
 }
 
 FrameItem FrameList::getFrameAfterAndLock(const nsecs_t& t) {
     std::lock_guard lock(mMutex);
-    FrameItem frame = getFrameAt(t, 1);
-    if (mLockingEnabled && frame.isValid()) lockLocked(frame);
-    return frame;
+    return copyLockingIfValidLocked(t, 1);
+}
+
+FrameItem FrameList::copyLockingIfValidLocked(nsecs_t t, int index) {
+    bool valid;
+    const FrameItem* frame = frameAtLocked(t, index, valid);
+    if (frame == nullptr) return FrameItem();
+    if (mLockingEnabled && valid) lockLocked(*frame);
+    return *frame;
 }
 
 FrameItem FrameList::getFrameAtAndLock(const nsecs_t& t) {
@@ -210,7 +244,7 @@ FrameItem FrameList::getFrameAtAndLock(const nsecs_t& t) {
 FrameItem FrameList::getLatestValidFrameAndLock() {
     std::lock_guard lock(mMutex);
     for (size_t i = mFrames.size(); i-- > 0;) {
-        if (mFrames[i].isValid()) {
+        if (mFrames[i].pollValid()) {
             lockLocked(mFrames[i]);
             return mFrames[i];
         }
@@ -276,7 +310,8 @@ bool FrameList::isOldestFrameUnused(const nsecs_t& t) {
 }
 
 bool FrameList::isOldestFrameUnusedLocked(const nsecs_t& t) {
-    return getFrameAt(t, -2).isValid();
+    bool valid;
+    return frameAtLocked(t, -2, valid) != nullptr && valid;
 }
 
 void FrameList::waitWhileLockedLocked(nsecs_t id, std::unique_lock<std::mutex>& lock) {
@@ -287,6 +322,8 @@ void FrameList::waitWhileLockedLocked(nsecs_t id, std::unique_lock<std::mutex>& 
 
 FrameItem FrameList::clearOldestFrameLockedLocking(std::unique_lock<std::mutex>& lock) {
     if (mFrames.empty()) return FrameItem();
+    // Without a wait the front cannot change, and the frame taken out is the result itself.
+    if (!isLockedLocked(mFrames.front().mID)) return mFrames.pop_front();
     FrameItem oldest = mFrames.front();
     waitWhileLockedLocked(oldest.mID, lock);
     // Whatever is at the front now goes; another removal may have emptied the list meanwhile.
@@ -318,8 +355,6 @@ FrameItem FrameList::clearFrameAtLocking(const nsecs_t& t) {
         });
         if (found != mFrames.end()) mFrames.erase(found);
     }
-    // Without a wait the front cannot change, and the frame taken out is the result itself.
-    if (!isLockedLocked(mFrames.front().mID)) return mFrames.pop_front();
     return frame;
 }
 
@@ -364,7 +399,11 @@ int FrameList::getFrameIndexBeforeLocked(const nsecs_t& t) const {
 }
 
 int FrameList::getIndexForFrame(const nsecs_t& t, const FrameItem& frame) const {
-    if (!frame.isValid()) {
+    return indexOfFrameLocked(t, frame, frame.isValid());
+}
+
+int FrameList::indexOfFrameLocked(nsecs_t t, const FrameItem& frame, bool valid) const {
+    if (!valid) {
         ILOG(1, "FrameList passed an invalid FrameItem");
         return 0;
     }

@@ -39,6 +39,7 @@ public:
         const FrameItem& operator[](size_t i) const { return mFrames[i]; }
         FrameItem& operator[](size_t i) { return mFrames[i]; }
         const FrameItem& front() const { return mFrames.front(); }
+        FrameItem& front() { return mFrames.front(); }
         const FrameItem& back() const { return mFrames.back(); }
         iterator begin() { return mFrames.begin(); }
         iterator end() { return mFrames.end(); }
@@ -76,6 +77,39 @@ public:
     FrameItem getFrameBefore(const nsecs_t& t);
     FrameItem getFrameAfter(const nsecs_t& t);
 
+    // The display times and validity of the frames getFrameBefore(t) and getFrameAfter(t) would
+    // return (0 and false where they would return the empty frame), found under one lock without
+    // copying the frames: all a composition decides from before it locks any.
+    struct Neighbours {
+        nsecs_t beforeID = 0;
+        bool beforeValid = false;
+        nsecs_t afterID = 0;
+        bool afterValid = false;
+    };
+    Neighbours getNeighbours(const nsecs_t& t);
+
+    // A composition's choice at display time t under one hold of the list's mutex, so that the
+    // frames it locks are the neighbours it chose from: neighbours() is what getNeighbours(t)
+    // returns, lockBefore() and lockAfter() what getFrameBeforeAndLock(t) and
+    // getFrameAfterAndLock(t) return, log lines included. The list may not be called otherwise
+    // while a pick lives.
+    class NeighbourPick {
+    public:
+        NeighbourPick(FrameList& list, nsecs_t t);
+        NeighbourPick(const NeighbourPick&) = delete;
+        NeighbourPick& operator=(const NeighbourPick&) = delete;
+
+        const Neighbours& neighbours() const { return mNeighbours; }
+        FrameItem lockBefore() { return mList.copyLockingIfValidLocked(mTime, -1); }
+        FrameItem lockAfter() { return mList.copyLockingIfValidLocked(mTime, 1); }
+
+    private:
+        FrameList& mList;
+        std::lock_guard<std::mutex> mLock;
+        const nsecs_t mTime;
+        const Neighbours mNeighbours;
+    };
+
     // Lock only a valid frame, and only until killLocks().
     FrameItem getFrameBeforeAndLock(const nsecs_t& t);
     FrameItem getFrameAfterAndLock(const nsecs_t& t);
@@ -112,6 +146,14 @@ private:
     bool hasFrameAtLocked(nsecs_t t) const;
     FrameItem getFrameAtLocked(nsecs_t t) const;
     void insertFrameLocked(FrameItem frame);
+    Neighbours neighboursLocked(nsecs_t t);
+    // The frame at relative index `index` for t, or null, and whether it is valid. Each fence is
+    // polled at most once, and a signal seen is remembered in the queue.
+    FrameItem* frameAtLocked(nsecs_t t, int index, bool& valid);
+    // A copy of that frame (the empty frame if none), locked if valid while locking is enabled.
+    FrameItem copyLockingIfValidLocked(nsecs_t t, int index);
+    // The relative index of `frame` for `t`, its validity already known.
+    int indexOfFrameLocked(nsecs_t t, const FrameItem& frame, bool valid) const;
     void waitWhileLockedLocked(nsecs_t id, std::unique_lock<std::mutex>& lock);
 
     mutable std::mutex mMutex;
