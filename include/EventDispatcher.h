@@ -70,8 +70,15 @@ public:
 
 private:
     using Subscription = std::pair<uint32_t /* flags */, wp<EventReceiver>>;
+    class CalledReceivers;
 
-    static EventDispatcher& getInstanceLocked();
+    static EventDispatcher& getInstanceLocked() {
+        if (mInstance == nullptr) mInstance.reset(new EventDispatcher());
+        return *mInstance;
+    }
+    // Delivers the event; `called` holds each receiver called, to be released after the mutex.
+    void deliverLocked(uint32_t uid, EventType type, nsecs_t time, const EventData& data,
+                       CalledReceivers& called);
 
     std::unordered_map<uint32_t, std::vector<Subscription>> mSubscriptions;  // by uid
 

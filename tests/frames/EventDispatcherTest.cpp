@@ -158,5 +158,23 @@ TEST_F(EventDispatcherTest, receiverReleasedDuringABroadcastUnsubscribesAfterIt)
                              mUidText));
 }
 
+TEST_F(EventDispatcherTest, receiversBeyondTheOnesABroadcastKeepsAtHandAlsoUnsubscribeAfterIt) {
+    std::vector<sp<SelfUnsubscribingReceiver>> receivers(40);
+    for (sp<SelfUnsubscribingReceiver>& receiver : receivers) {
+        receiver = new SelfUnsubscribingReceiver(mUid, &receiver);
+        EventDispatcher::subscribe(mUid, EventDispatcher::ALL_EVENTS, receiver);
+    }
+    std::vector<wp<SelfUnsubscribingReceiver>> weak(receivers.begin(), receivers.end());
+
+    broadcast(eFrameReceivedEvent);
+
+    for (const wp<SelfUnsubscribingReceiver>& receiver : weak)
+        EXPECT_EQ(nullptr, receiver.promote());
+    LogCapture log(1);
+    broadcast(eFrameReceivedEvent);
+    EXPECT_TRUE(log.contains("EventDispatcher::broadcastEventLocked no subscribers for uid " +
+                             mUidText));
+}
+
 }  // namespace
 }  // namespace android::Interpolation
