@@ -187,19 +187,7 @@ FrameItem FrameList::getFrameAfter(const nsecs_t& t) {
 }
 
 FrameList::Neighbours FrameList::getNeighbours(const nsecs_t& t) {
-    std::lock_guard lock(mMutex);
-    return neighboursLocked(t);
-}
-
-FrameList::Neighbours FrameList::neighboursLocked(nsecs_t t) {
-    Neighbours neighbours;
-    if (const FrameItem* before = frameAtLocked(t, -1, neighbours.beforeValid)) {
-        neighbours.beforeID = before->mID;
-    }
-    if (const FrameItem* after = frameAtLocked(t, 1, neighbours.afterValid)) {
-        neighbours.afterID = after->mID;
-    }
-    return neighbours;
+    return NeighbourPick(*this, t).neighbours();
 }
 
 bool FrameList::isLockedLocked(nsecs_t id) const {
@@ -212,7 +200,24 @@ void FrameList::lockLocked(const FrameItem& frame) {
 }
 
 FrameList::NeighbourPick::NeighbourPick(FrameList& list, nsecs_t t)
-    : mList(list), mLock(list.mMutex), mTime(t), mNeighbours(list.neighboursLocked(t)) {}
+    : mList(list), mLock(list.mMutex) {
+    mBefore = list.frameAtLocked(t, -1, mNeighbours.beforeValid);
+    mAfter = list.frameAtLocked(t, 1, mNeighbours.afterValid);
+    if (mBefore != nullptr) mNeighbours.beforeID = mBefore->mID;
+    if (mAfter != nullptr) mNeighbours.afterID = mAfter->mID;
+}
+
+FrameItem FrameList::NeighbourPick::lock(const FrameItem* frame, bool valid) {
+    // The queue cannot have changed since the look-up: only its lines are logged again.
+    if (mList.mFrames.empty()) {
+        ILOG(1, "FrameList is empty");
+        return FrameItem();
+    }
+    if (!mList.mFrames.front().isValid()) ILOG(1, "FrameList passed an invalid FrameItem");
+    if (frame == nullptr) return FrameItem();
+    if (mList.mLockingEnabled && valid) mList.lockLocked(*frame);
+    return *frame;
+}
 
 FrameItem FrameList::getFrameBeforeAndLock(const nsecs_t& t) {
     std::lock_guard lock(mMutex);

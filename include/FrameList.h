@@ -91,8 +91,8 @@ public:
     // A composition's choice at display time t under one hold of the list's mutex, so that the
     // frames it locks are the neighbours it chose from: neighbours() is what getNeighbours(t)
     // returns, lockBefore() and lockAfter() what getFrameBeforeAndLock(t) and
-    // getFrameAfterAndLock(t) return, log lines included. The list may not be called otherwise
-    // while a pick lives.
+    // getFrameAfterAndLock(t) would have returned then, log lines included. The list may not be
+    // called otherwise while a pick lives.
     class NeighbourPick {
     public:
         NeighbourPick(FrameList& list, nsecs_t t);
@@ -100,14 +100,17 @@ public:
         NeighbourPick& operator=(const NeighbourPick&) = delete;
 
         const Neighbours& neighbours() const { return mNeighbours; }
-        FrameItem lockBefore() { return mList.copyLockingIfValidLocked(mTime, -1); }
-        FrameItem lockAfter() { return mList.copyLockingIfValidLocked(mTime, 1); }
+        FrameItem lockBefore() { return lock(mBefore, mNeighbours.beforeValid); }
+        FrameItem lockAfter() { return lock(mAfter, mNeighbours.afterValid); }
 
     private:
+        FrameItem lock(const FrameItem* frame, bool valid);
+
         FrameList& mList;
         std::lock_guard<std::mutex> mLock;
-        const nsecs_t mTime;
-        const Neighbours mNeighbours;
+        Neighbours mNeighbours;
+        const FrameItem* mBefore = nullptr;
+        const FrameItem* mAfter = nullptr;
     };
 
     // Lock only a valid frame, and only until killLocks().
@@ -146,7 +149,6 @@ private:
     bool hasFrameAtLocked(nsecs_t t) const;
     FrameItem getFrameAtLocked(nsecs_t t) const;
     void insertFrameLocked(FrameItem frame);
-    Neighbours neighboursLocked(nsecs_t t);
     // The frame at relative index `index` for t, or null, and whether it is valid. Each fence is
     // polled at most once, and a signal seen is remembered in the queue.
     FrameItem* frameAtLocked(nsecs_t t, int index, bool& valid);

@@ -217,6 +217,16 @@ TEST_F(FrameListTest, neighboursAreWhatTheLookUpsBeforeAndAfterFindWithTheirLogL
     }
     // From a pending oldest frame every look-up logs, and the neighbours count as two.
     EXPECT_EQ(6 * 4, log.count("FrameList passed an invalid FrameItem"));
+
+    // A pick locks what the locking look-up would have, and logs as it would.
+    log.clear();
+    const FrameItem picked = FrameList::NeighbourPick(*mList, 15).lockAfter();
+    EXPECT_EQ(3, log.count("FrameList passed an invalid FrameItem"));
+    mList->unlock(picked.mID);
+    EXPECT_EQ(mList->getFrameAfterAndLock(15).mID, picked.mID);
+    EXPECT_EQ(4, log.count("FrameList passed an invalid FrameItem"));
+    EXPECT_EQ(10, picked.mID);
+    EXPECT_FALSE(log.contains("FrameList attempted to unlock non-locked frame 10"));
 }
 
 TEST_F(FrameListTest, lockingLookUpsChooseTheirFramesAndOnlyBeforeAndAfterStopAtKillLocks) {
