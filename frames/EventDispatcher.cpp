@@ -106,17 +106,23 @@ void EventDispatcher::broadcastEventLocked(const uint32_t& uid, const EventType&
 
 void EventDispatcher::deliverLocked(uint32_t uid, EventType type, nsecs_t time,
                                     const EventData& data, CalledReceivers& called) {
-    auto entry = mSubscriptions.find(uid);
-    if (entry == mSubscriptions.end()) {
+    std::vector<Subscription>* subscriptions = uid == mLastUid ? mLastSubscriptions : nullptr;
+    if (subscriptions == nullptr) {
+        auto entry = mSubscriptions.find(uid);
+        if (entry == mSubscriptions.end()) {
+            ILOG(1, "EventDispatcher::broadcastEventLocked no subscribers for uid %d", uid);
+            return;
+        }
+        subscriptions = &entry->second;
+    }
+    if (subscriptions->empty()) {
         ILOG(1, "EventDispatcher::broadcastEventLocked no subscribers for uid %d", uid);
+        eraseLocked(uid);
         return;
     }
-    if (entry->second.empty()) {
-        ILOG(1, "EventDispatcher::broadcastEventLocked no subscribers for uid %d", uid);
-        mSubscriptions.erase(entry);
-        return;
-    }
-    for (const auto& [flags, receiver] : entry->second) {
+    mLastUid = uid;
+    mLastSubscriptions = subscriptions;
+    for (const auto& [flags, receiver] : *subscriptions) {
         if ((flags & type) == 0) continue;
         sp<EventReceiver> strong = receiver.promote();
         if (strong == nullptr) {
@@ -130,6 +136,11 @@ void EventDispatcher::deliverLocked(uint32_t uid, EventType type, nsecs_t time,
         strong->onEvent(type, time, data);
         called.hold(std::move(strong));
     }
+}
+
+void EventDispatcher::eraseLocked(uint32_t uid) {
+    mSubscriptions.erase(uid);
+    if (uid == mLastUid) mLastSubscriptions = nullptr;
 }
 
 void EventDispatcher::subscribeLocked(const uint32_t& uid, const uint32_t& flags,
@@ -154,7 +165,7 @@ void EventDispatcher::unsubscribeLocked(const uint32_t& uid, const uint32_t& fla
     std::vector<Subscription>& subscriptions = entry->second;
     if (subscriptions.empty()) {
         ILOG(1, "EventDispatcher::unsubscribeLocked no subscribers for uid %d", uid);
-        mSubscriptions.erase(entry);
+        eraseLocked(uid);
         return;
     }
     auto found =

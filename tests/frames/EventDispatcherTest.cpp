@@ -126,6 +126,20 @@ TEST_F(EventDispatcherTest, subobjectsSharingAReferenceBlockAreDistinctReceivers
     EventDispatcher::unsubscribe(mUid, eFrameReceivedEvent, first);
 }
 
+TEST_F(EventDispatcherTest, aUidErasedAfterABroadcastIsFoundAnewWhenSubscribedAgain) {
+    sp<RecordingReceiver> first = new RecordingReceiver();
+    sp<RecordingReceiver> second = new RecordingReceiver();
+    EventDispatcher::subscribe(mUid, EventDispatcher::ALL_EVENTS, first);
+    broadcast(eFrameReceivedEvent);
+    EventDispatcher::unsubscribe(mUid, EventDispatcher::ALL_EVENTS, first);
+    broadcast(eFrameReceivedEvent);  // erases the emptied entry
+    EventDispatcher::subscribe(mUid, EventDispatcher::ALL_EVENTS, second);
+    broadcast(eFrameReleasedEvent);
+    EXPECT_THAT(first->types(), ElementsAre(1u));
+    EXPECT_THAT(second->types(), ElementsAre(2u));
+    EventDispatcher::unsubscribe(mUid, EventDispatcher::ALL_EVENTS, second);
+}
+
 // A receiver that unsubscribes when its last strong reference goes, as every component does.
 class SelfUnsubscribingReceiver : public EventDispatcher::EventReceiver {
 public:
