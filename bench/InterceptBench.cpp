@@ -19,6 +19,8 @@ constexpr int SLOTS = 8;
 // Signalled eventfd fences, handed out in turn: a fence comes round again long after its frame
 // has left the queue.
 constexpr size_t FENCE_COUNT = 64;
+// Frames before the measured ones, so that storage that grows to its steady size has done so.
+constexpr int WARM_UP = 16;
 
 std::vector<sp<Fence>> signalledFences() {
     std::vector<sp<Fence>> fences;
@@ -48,19 +50,28 @@ void BM_InterceptFramePair(benchmark::State& state) {
     const std::vector<sp<Fence>> fences = signalledFences();
     uint64_t frameNumber = 1;
     nsecs_t timestamp = 1'000'000'000;
-    SectionTimer section(state);
-    for (auto _ : state) {
+    const auto intercept = [&] {
         const int slot = static_cast<int>(frameNumber % SLOTS);
         const sp<Fence>& fence = fences[frameNumber % fences.size()];
-        section.start();
         interceptor->interceptFrame(frameNumber, slot, buffer, timestamp, fence, false);
         interceptor->interceptFrame(frameNumber, slot, buffer, timestamp, fence, true);
-        section.stop();
-
+    };
+    const auto nextFrame = [&] {
         while (list->size() > queued)
             list->clearOldestFrameLocking();
         frameNumber++;
         timestamp += FRAME_PERIOD;
+    };
+    for (int i = 0; i < WARM_UP; i++) {
+        intercept();
+        nextFrame();
+    }
+    SectionTimer section(state);
+    for (auto _ : state) {
+        section.start();
+        intercept();
+        section.stop();
+        nextFrame();
     }
 }
 BENCHMARK(BM_InterceptFramePair)->ArgName("frames")->Arg(4)->Arg(2)->Arg(16)->UseManualTime();
