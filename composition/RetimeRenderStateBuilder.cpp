@@ -95,14 +95,14 @@ RenderState RetimeRenderStateBuilder::getFramesFor(nsecs_t const& displayTime) {
 
 RenderState RetimeRenderStateBuilder::setupFramesFor(RenderState&& state,
                                                      nsecs_t const& displayTime) {
-    state = setupOpaqueFrame(std::move(state));
-    if (state.items.size() > 1) {
-        RenderItem& later = state.items[1];
+    RenderState opaque = setupOpaqueFrame(std::move(state));
+    if (opaque.items.size() > 1) {
+        RenderItem& later = opaque.items[1];
         later.alpha = getAlphaFromFunction(
-                positionBetween(displayTime, state.items[0].frame.mID, later.frame.mID));
+                positionBetween(displayTime, opaque.items[0].frame.mID, later.frame.mID));
         later.blend = 1;
     }
-    return std::move(state);
+    return opaque;
 }
 
 }  // namespace android::Interpolation

@@ -159,9 +159,18 @@ FrameItem* FrameList::frameAtLocked(nsecs_t t, int index, bool& valid) {
     }
     // An oldest frame that is not valid yet counts as index 0, so that negative indices find
     // nothing until it is ready.
+    // The oldest frame's relative index as getIndexForFrame gives it, knowing that it is queued
+    // at position 0.
     FrameItem& oldest = mFrames.front();
     const bool oldestValid = oldest.pollValid();
-    const int64_t oldestIndex = indexOfFrameLocked(t, oldest, oldestValid);
+    int64_t oldestIndex = 0;
+    if (!oldestValid) {
+        ILOG(1, "FrameList passed an invalid FrameItem");
+    } else if (t < oldest.mID) {
+        oldestIndex = 1;
+    } else {
+        oldestIndex = -getPresentQueueIndex(t);
+    }
     int64_t position = int64_t{index} - oldestIndex;
     if (index > 0 && oldestIndex < 0) position -= 1;  // the gap at index 0
     if (position < 0 || position >= static_cast<int64_t>(mFrames.size())) return nullptr;
@@ -404,11 +413,7 @@ int FrameList::getFrameIndexBeforeLocked(const nsecs_t& t) const {
 }
 
 int FrameList::getIndexForFrame(const nsecs_t& t, const FrameItem& frame) const {
-    return indexOfFrameLocked(t, frame, frame.isValid());
-}
-
-int FrameList::indexOfFrameLocked(nsecs_t t, const FrameItem& frame, bool valid) const {
-    if (!valid) {
+    if (!frame.isValid()) {
         ILOG(1, "FrameList passed an invalid FrameItem");
         return 0;
     }

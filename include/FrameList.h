@@ -154,8 +154,6 @@ private:
     FrameItem* frameAtLocked(nsecs_t t, int index, bool& valid);
     // A copy of that frame (the empty frame if none), locked if valid while locking is enabled.
     FrameItem copyLockingIfValidLocked(nsecs_t t, int index);
-    // The relative index of `frame` for `t`, its validity already known.
-    int indexOfFrameLocked(nsecs_t t, const FrameItem& frame, bool valid) const;
     void waitWhileLockedLocked(nsecs_t id, std::unique_lock<std::mutex>& lock);
 
     mutable std::mutex mMutex;
