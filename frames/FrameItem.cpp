@@ -38,15 +38,6 @@ bool FrameItem::isReady() const {
            mAcquireFence->wait(0) == NO_ERROR;
 }
 
-bool FrameItem::pollReady() {
-    if (mAcquired || mAcquireFence == nullptr || mSignalledFence == mAcquireFence.get()) {
-        return true;
-    }
-    if (mAcquireFence->wait(0) != NO_ERROR) return false;
-    mSignalledFence = mAcquireFence.get();
-    return true;
-}
-
 namespace Interpolation {
 
 nsecs_t RenderState::meanFrameID() const {

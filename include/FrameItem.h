@@ -44,8 +44,16 @@ struct FrameItem {
     bool isReady() const;
     // A queued frame that can be composed: a desired display time, and ready.
     bool isValid() const { return mID != 0 && isReady(); }
-    // The same, remembering a signal it sees.
-    bool pollReady();
+    // The same, remembering a signal it sees. Defined here so that the poll is made from the
+    // caller's own frame: after a system call each return above it is mispredicted.
+    bool pollReady() {
+        if (mAcquired || mAcquireFence == nullptr || mSignalledFence == mAcquireFence.get()) {
+            return true;
+        }
+        if (mAcquireFence->wait(0) != NO_ERROR) return false;
+        mSignalledFence = mAcquireFence.get();
+        return true;
+    }
     bool pollValid() { return mID != 0 && pollReady(); }
 };
 
