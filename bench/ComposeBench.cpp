@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "BenchReceivers.h"
+#include "BenchSupport.h"
 #include "Delayer.h"
 #include "FrameTimings.h"
 #include "JustInTimeReleasePicker.h"
@@ -19,19 +20,6 @@ namespace {
 
 constexpr nsecs_t FRAME_PERIOD = 33'333'333;    // a 30 FPS game
 constexpr nsecs_t REFRESH_PERIOD = 16'666'666;  // on a 60 Hz display
-// Signalled eventfd fences, handed out in turn: a fence comes round again long after its frame
-// has left the queue.
-constexpr size_t FENCE_COUNT = 64;
-// Refreshes before the measured ones, so that storage that grows to its steady size has done so.
-constexpr int WARM_UP = 16;
-
-std::vector<sp<Fence>> signalledFences() {
-    std::vector<sp<Fence>> fences;
-    for (size_t i = 0; i < FENCE_COUNT; i++)
-        fences.push_back(Fence::createSignalled(static_cast<nsecs_t>(i + 1)));
-    return fences;
-}
-
 FrameItem acquiredFrame(uint64_t number, nsecs_t id, const sp<GraphicBuffer>& buffer) {
     FrameItem frame;
     frame.mIndex = number;
@@ -181,32 +169,6 @@ public:
 private:
     std::mutex mMutex;
     std::vector<RenderItem> mLastComposed;  // guarded by mMutex
-};
-
-// A bus with nothing but its mutex and its receivers: promoted under the mutex, released after it.
-class FloorBus {
-public:
-    void subscribe(uint32_t flags, const sp<EventDispatcher::EventReceiver>& receiver) {
-        mSubscriptions.emplace_back(flags, receiver);
-    }
-    void broadcast(EventType type, nsecs_t time, const EventData& data) {
-        sp<EventDispatcher::EventReceiver> called[4];
-        size_t count = 0;
-        {
-            std::lock_guard lock(mMutex);
-            for (const auto& [flags, receiver] : mSubscriptions) {
-                if ((flags & type) == 0) continue;
-                sp<EventDispatcher::EventReceiver> strong = receiver.promote();
-                if (strong == nullptr) continue;
-                strong->onEvent(type, time, data);
-                called[count++] = std::move(strong);
-            }
-        }
-    }
-
-private:
-    std::mutex mMutex;
-    std::vector<std::pair<uint32_t, wp<EventDispatcher::EventReceiver>>> mSubscriptions;
 };
 
 // What one refresh of BM_RetimeRefresh cannot avoid, done with the plainest means: the builder's

@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "BenchReceivers.h"
+#include "BenchSupport.h"
 #include "FrameInterceptor.h"
 #include "ReleasePicker.h"
 #include "SectionTimer.h"
@@ -16,19 +17,6 @@ namespace {
 
 constexpr nsecs_t FRAME_PERIOD = 16'666'666;  // a 60 FPS game
 constexpr int SLOTS = 8;
-// Signalled eventfd fences, handed out in turn: a fence comes round again long after its frame
-// has left the queue.
-constexpr size_t FENCE_COUNT = 64;
-// Frames before the measured ones, so that storage that grows to its steady size has done so.
-constexpr int WARM_UP = 16;
-
-std::vector<sp<Fence>> signalledFences() {
-    std::vector<sp<Fence>> fences;
-    for (size_t i = 0; i < FENCE_COUNT; i++)
-        fences.push_back(Fence::createSignalled(static_cast<nsecs_t>(i + 1)));
-    return fences;
-}
-
 // One buffer's queue call and acquire call, in mode 0 with a delayer, as the buffer thread makes
 // them at 60 FPS, with the receivers a mode-0 layer has: the delayer, the release picker and the
 // ring log. Each buffer comes with a real fence that has signalled. Only the pair is timed and
@@ -75,32 +63,6 @@ void BM_InterceptFramePair(benchmark::State& state) {
     }
 }
 BENCHMARK(BM_InterceptFramePair)->ArgName("frames")->Arg(4)->Arg(2)->Arg(16)->UseManualTime();
-
-// A bus with nothing but its mutex and its receivers: promoted under the mutex, released after it.
-class FloorBus {
-public:
-    void subscribe(uint32_t flags, const sp<EventDispatcher::EventReceiver>& receiver) {
-        mSubscriptions.emplace_back(flags, receiver);
-    }
-    void broadcast(EventType type, nsecs_t time, const EventData& data) {
-        sp<EventDispatcher::EventReceiver> called[4];
-        size_t count = 0;
-        {
-            std::lock_guard lock(mMutex);
-            for (const auto& [flags, receiver] : mSubscriptions) {
-                if ((flags & type) == 0) continue;
-                sp<EventDispatcher::EventReceiver> strong = receiver.promote();
-                if (strong == nullptr) continue;
-                strong->onEvent(type, time, data);
-                called[count++] = std::move(strong);
-            }
-        }
-    }
-
-private:
-    std::mutex mMutex;
-    std::vector<std::pair<uint32_t, wp<EventDispatcher::EventReceiver>>> mSubscriptions;
-};
 
 // Fixed storage for fence wrappers, taken and given back under a mutex.
 class FloorFenceTimePool {
