@@ -4,7 +4,7 @@ namespace android::Interpolation {
 
 FillInReleasePicker::FillInReleasePicker(sp<FrameList>& frameList, String8& name,
                                          const uint32_t& uid)
-    : ReleasePicker(frameList, name, uid) {}
+    : ReleasePicker(frameList, name, uid, eFrameReceivedEvent) {}
 
 ReleaseChoice FillInReleasePicker::tryRelease() {
     beginTryReleaseLocked("FillInReleasePicker");

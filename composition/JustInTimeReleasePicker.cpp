@@ -1,12 +1,13 @@
 #include "JustInTimeReleasePicker.h"
 
+#include "../timing/Saturating.h"
 #include "Log.h"
 
 namespace android::Interpolation {
 
 JustInTimeReleasePicker::JustInTimeReleasePicker(sp<FrameList>& frameList, String8& name,
                                                  const uint32_t& uid)
-    : ReleasePicker(frameList, name, uid) {}
+    : ReleasePicker(frameList, name, uid, EVENT_FLAGS) {}
 
 void JustInTimeReleasePicker::onFirstRef() {
     ILOG(2, "Interpolation::JustInTimeReleasePicker [%s] onFirstRef", mName.c_str());
@@ -51,9 +52,13 @@ ReleaseChoice JustInTimeReleasePicker::tryRelease() {
 ReleaseChoice JustInTimeReleasePicker::attempEarlyRelease() {
     // Without a margin, frames only go once the newest is on screen.
     if (mEarlyReleaseMargin == 0) return {};
-    const nsecs_t remaining = mUpcomingCompositionTime - systemTime(SYSTEM_TIME_MONOTONIC);
+    const nsecs_t remaining =
+            saturatingSub(mUpcomingCompositionTime, systemTime(SYSTEM_TIME_MONOTONIC));
     if (remaining < mEarlyReleaseMargin) return chooseOldestFrame();
-    return {ReleaseChoice::WAIT_FOR_TIME, FrameItem(), remaining - mEarlyReleaseMargin};
+    // A negative margin makes this a wait past the composition, as long as the setting says; the
+    // selection bounds it.
+    return {ReleaseChoice::WAIT_FOR_TIME, FrameItem(),
+            saturatingSub(remaining, mEarlyReleaseMargin)};
 }
 
 }  // namespace android::Interpolation

@@ -47,6 +47,21 @@ void MLLatencyReductionReleasePicker::setFrameListCapacity(size_t capacity) {
 
 ReleaseChoice MLLatencyReductionReleasePicker::tryRelease() {
     ScopedTrace trace("tryRelease");
+    const ReleaseChoice choice = decideLocked();
+    if (choice.action != ReleaseChoice::RELEASE_AFTER_SLEEP) return choice;
+    const nsecs_t delay = choice.waitTime;
+    // A delayer never returns a negative delay; were one to, it must not become a sleep of hours.
+    const nsecs_t sleep = std::max<nsecs_t>(delay, 0) / 1000;
+    if (usleep(static_cast<useconds_t>(sleep)) != 0) {
+        ILOG(1,
+             "Interpolation::MLLatencyReductionReleasePicker: [%s] tryRelease usleep failed for "
+             "delay %ld",
+             mName.c_str(), delay);
+    }
+    return chooseOldestFrame();
+}
+
+ReleaseChoice MLLatencyReductionReleasePicker::decideLocked() {
     beginTryReleaseLocked("MLLatencyReductionReleasePicker");
     if (mFrameList->size() < mFrameListCapacity) return {};
 
@@ -61,16 +76,8 @@ ReleaseChoice MLLatencyReductionReleasePicker::tryRelease() {
     });
     if (!newestOnScreen) return {};
 
-    const nsecs_t delay = mDelayer->getDelay(mUpcomingCompositionTime);
-    // A delayer never returns a negative delay; were one to, it must not become a sleep of hours.
-    const nsecs_t sleep = std::max<nsecs_t>(delay, 0) / 1000;
-    if (usleep(static_cast<useconds_t>(sleep)) != 0) {
-        ILOG(1,
-             "Interpolation::MLLatencyReductionReleasePicker: [%s] tryRelease usleep failed for "
-             "delay %ld",
-             mName.c_str(), delay);
-    }
-    return chooseOldestFrame();
+    return {ReleaseChoice::RELEASE_AFTER_SLEEP, FrameItem(),
+            mDelayer->getDelay(mUpcomingCompositionTime)};
 }
 
 }  // namespace android::Interpolation

@@ -1,8 +1,10 @@
 #include "ReleasePicker.h"
 
+#include <algorithm>
 #include <chrono>
 #include <thread>
 
+#include "../timing/Saturating.h"
 #include "FillInReleasePicker.h"
 #include "JustInTimeReleasePicker.h"
 #include "Log.h"
@@ -23,6 +25,16 @@ steady_clock::time_point deadlineAfter(nsecs_t waitTime) {
     const std::chrono::nanoseconds wait(waitTime);
     if (wait >= steady_clock::time_point::max() - now) return steady_clock::time_point::max();
     return now + wait;
+}
+
+// Keeps a composed state for the policies, which read its frames' identities and display times,
+// without the frames' fences: the last reference to a fence closes its descriptor, and the copies
+// kept here are overwritten inside the event delivery on the composition thread, possibly after
+// the frames have left the queue. The event's own state still holds every fence dropped here.
+void keepComposedItems(const std::vector<RenderItem>& from, std::vector<RenderItem>& to) {
+    to = from;  // reuses the storage
+    for (RenderItem& item : to)
+        item.frame.mAcquireFence.clear();
 }
 
 }  // namespace
@@ -47,8 +59,9 @@ sp<ReleasePicker> ReleasePicker::newPickerFromMode(sp<FrameList>& frameList,
     }
 }
 
-ReleasePicker::ReleasePicker(sp<FrameList>& frameList, String8& name, const uint32_t& uid)
-    : mFrameList(frameList), mName(name), mUid(uid) {}
+ReleasePicker::ReleasePicker(sp<FrameList>& frameList, String8& name, const uint32_t& uid,
+                             uint32_t decisionEvents)
+    : mFrameList(frameList), mName(name), mUid(uid), mDecisionEvents(decisionEvents) {}
 
 ReleasePicker::~ReleasePicker() {
     ILOG(2, "Interpolation::ReleasePicker [%s] destructor", mName.c_str());
@@ -86,7 +99,7 @@ void ReleasePicker::onEvent(const EventType& type, const nsecs_t& /*time*/, cons
         case eBufferComposedEvent:
             if (const auto* state = std::get_if<RenderState>(&data)) {
                 std::lock_guard lock(mInboxMutex);
-                mInbox.composedState.items = state->items;  // reuses the inbox's storage
+                keepComposedItems(state->items, mInbox.composedState.items);
                 mInbox.hasComposedState = true;
             } else {
                 ILOG(2,
@@ -100,7 +113,7 @@ void ReleasePicker::onEvent(const EventType& type, const nsecs_t& /*time*/, cons
             ILOG(1, "ReleasePicker::onEvent EventType %u not handled", type);
             return;
     }
-    wakeSelection();
+    wakeSelection((type & mDecisionEvents) != 0);
 }
 
 void ReleasePicker::applyInboxLocked() {
@@ -116,8 +129,8 @@ void ReleasePicker::applyInboxLocked() {
     }
 }
 
-void ReleasePicker::wakeSelection() {
-    mEventCount.fetch_add(1);
+void ReleasePicker::wakeSelection(bool decisionEvent) {
+    if (decisionEvent) mEventCount.fetch_add(1);
     // A running step re-reads the count before it waits. Otherwise mMutex is only held for
     // moments that never wait on the frame list or the bus, and taking it here orders this wake-up
     // after the selection's wait has begun.
@@ -129,16 +142,40 @@ void ReleasePicker::wakeSelection() {
         }
         std::this_thread::yield();
     }
-    mCondition.notify_all();
+    // An event the policy does not read cannot change its decision; waking the selection for it
+    // would cost the sender (mostly the composition thread) a system call and the release thread a
+    // step for nothing.
+    if (decisionEvent) mCondition.notify_all();
 }
 
-ReleaseChoice ReleasePicker::decideLocked(uint32_t& eventsSeen) {
+ReleaseChoice ReleasePicker::stepLocked(bool blocking, uint32_t& eventsSeen) {
     mDeciding.store(true);
     eventsSeen = mEventCount.load();
     applyInboxLocked();
-    ReleaseChoice choice = tryRelease();
+    ReleaseChoice choice = blocking ? tryRelease() : decideLocked();
     mDeciding.store(false);
+    if (choice.action == ReleaseChoice::WAIT_FOR_TIME) boundWaitLocked(choice);
     return choice;
+}
+
+void ReleasePicker::boundWaitLocked(ReleaseChoice& choice) {
+    // Every bound is at least MAX_WAIT_PAST_COMPOSITION: a shorter wait needs no clock read.
+    if (choice.waitTime <= MAX_WAIT_PAST_COMPOSITION) return;
+    const nsecs_t untilComposition =
+            saturatingSub(mUpcomingCompositionTime, systemTime(SYSTEM_TIME_MONOTONIC));
+    const nsecs_t bound =
+            saturatingAdd(std::max<nsecs_t>(untilComposition, 0), MAX_WAIT_PAST_COMPOSITION);
+    if (choice.waitTime <= bound) return;
+    ILOG(1, "Interpolation::ReleasePicker [%s] wait of %ld ns bounded to %ld ns", mName.c_str(),
+         choice.waitTime, bound);
+    choice.waitTime = bound;
+}
+
+ReleaseChoice ReleasePicker::decideRelease() {
+    std::lock_guard lock(mMutex);
+    if (!mContinue) return {ReleaseChoice::RELEASE, FrameItem(), 0};
+    uint32_t eventsSeen;
+    return stepLocked(/*blocking=*/false, eventsSeen);
 }
 
 FrameItem ReleasePicker::selectFrameForRelease() {
@@ -155,7 +192,7 @@ FrameItem ReleasePicker::selectFrameForRelease() {
         if (!mContinue) break;
 
         uint32_t eventsSeen;
-        choice = decideLocked(eventsSeen);
+        choice = stepLocked(/*blocking=*/true, eventsSeen);
         const bool eventArrived = mEventCount.load() != eventsSeen;
 
         if (choice.action == ReleaseChoice::WAIT_FOR_TIME) {

@@ -8,6 +8,7 @@
 #include <atomic>
 #include <condition_variable>
 #include <functional>
+#include <limits>
 #include <memory>
 #include <mutex>
 #include <thread>
@@ -21,6 +22,11 @@
 #include "RealFPSTracker.h"
 #include "ReleasePicker.h"
 #include "RenderStateBuilder.h"
+#include "host/LayerMonitor.h"
+#include "host/LayerRates.h"
+#include "host/LayerSettings.h"
+#include "host/RefreshClassifier.h"
+#include "host/RetiredFences.h"
 #include "host/SettingsMessage.h"
 
 namespace verolux::host {
@@ -29,8 +35,23 @@ namespace verolux::host {
 // for its mode, hands them every buffer the game queues and acquires, asks for a state at every
 // refresh and gives the frames back after composing, and runs the release thread. Frames that leave
 // the frame list, by whichever path, are handed back through the FrameReleasedCallback.
+//
+// Around that it runs the layer's rates (LayerRates), statistics and watchdogs (LayerMonitor). A
+// layer whose settings do not interpolate it (gameFpsLimit below 1, as after a watchdog switched
+// the game off) is composed as the platform composes any layer: the host latches the newest
+// acquired frame itself, shows it whole, and lets every older frame go.
 class LayerHost {
 public:
+    enum class CompositionType { DEVICE, CLIENT };
+
+    // What the host reports of the layer besides its pictures.
+    struct Status {
+        int32_t refreshRate = 0;            // the detected refresh rate, Hz
+        int32_t gameRateLimit = 0;          // the game-rate agent's limit, 0 before the first
+        bool gameRateLimitApplied = false;  // the game is held to it (gfpsOffsetEnabled)
+        bool interpolating = false;         // the settings interpolate the layer
+    };
+
     struct Config {
         android::String8 name;
         uint32_t uid = 0;
@@ -49,12 +70,17 @@ public:
 
     // Starts the release thread.
     void start();
-    // Tear-down, in the order that never blocks: no more waiting on frame locks, the release thread
-    // ends, the frames still queued are handed back. Refreshes and buffers must have stopped.
+    // Tear-down, in the order that never blocks: no more waiting on frame locks, the picker stops,
+    // which ends the release thread's wait whatever it waits for, the release thread ends, the
+    // frames still queued are handed back. Refreshes and buffers must have stopped.
     void stop();
 
-    // The buffer queue's side.
+    // The buffer queue's side. An acquisition that comes after the engine has already let the frame
+    // go (a release picker may release a queued frame while the queue is acquiring it) is ignored,
+    // so that the frame does not come back into the engine's queue.
     void onBufferDequeued(int slot, nsecs_t requestTime, nsecs_t dequeueTime);
+    // The producer found no free buffer and waits for one.
+    void onBufferBackpressure();
     void onBufferQueued(uint64_t frameNumber, int slot,
                         const android::sp<android::GraphicBuffer>& buffer, nsecs_t timestamp,
                         const android::sp<android::Fence>& acquireFence);
@@ -62,11 +88,24 @@ public:
                           const android::sp<android::GraphicBuffer>& buffer, nsecs_t timestamp,
                           const android::sp<android::Fence>& acquireFence);
 
-    // The display's side: the state to compose for `displayTime`; its frames stay locked until
-    // onCompositionDone.
-    android::Interpolation::RenderState compose(nsecs_t displayTime);
+    // The display's side, on one thread, at every refresh: onVsync, which says whether the layer
+    // presents at this refresh; when it does, compose, the state for `displayTime`, whose frames
+    // stay locked until onCompositionDone; then onCompositionDone always, with the composed state
+    // (an empty one when the layer did not present: it keeps its previous picture).
+    bool onVsync(nsecs_t vsync);
+    const android::Interpolation::RenderState& compose(nsecs_t displayTime);
     void onCompositionDone(const android::Interpolation::RenderState& state, nsecs_t displayTime,
-                           const std::shared_ptr<android::FenceTime>& presentFence);
+                           const std::shared_ptr<android::FenceTime>& presentFence,
+                           CompositionType type = CompositionType::DEVICE);
+
+    Status status() const;
+    // The frame-event counts of the second before `now`.
+    FrameRateStatistics statistics(nsecs_t now) const;
+    // The layer in the platform's dumpsys style: the frame list, the delay, the statistics line,
+    // the version block and the settings line.
+    void dump(android::String8& out) const;
+    // The layer's event ring log, as the controlling service reads it.
+    void writeRingLog(android::Parcel& out) const;
 
     const Config& config() const { return mConfig; }
     const android::sp<android::FrameList>& frameList() const { return mFrameList; }
@@ -74,15 +113,16 @@ public:
 private:
     class ReleaseListener;
 
-    // Frames leaving the list are handed back; frame arrivals and compositions wake the release
-    // thread when its picker had nothing to release.
-    static constexpr uint32_t LISTENED_EVENTS = android::Interpolation::eFrameReleasedEvent |
-                                                android::Interpolation::eFrameReceivedEvent |
-                                                android::Interpolation::eBufferComposedEvent;
+    static constexpr uint64_t NO_FRAME = std::numeric_limits<uint64_t>::max();
 
     void noteQueueChange();
+    void noteFrameLeft(uint64_t frameNumber, int slot);
     void releaseLoop(android::sp<android::Interpolation::ReleasePicker> picker);
+    void setLeavingFrame(uint64_t frameNumber);
     void recordReleases();
+    void latchNewestFrame();
+    // Lets go the frames that no later refresh will show.
+    void clearUnusedFrames(nsecs_t displayTime);
 
     const Config mConfig;
     const android::sp<android::FrameList> mFrameList;
@@ -95,6 +135,19 @@ private:
             mDeadlinePredictor;
     const FrameReleasedCallback mOnFrameReleased;
     android::sp<ReleaseListener> mReleaseListener;
+    // Frames leaving the list, to hand them back, and the events after which the picker may
+    // decide otherwise, to ask it again when it had nothing to release.
+    uint32_t mListenedEvents = 0;
+    const android::sp<LayerSettings> mSettings;
+    // Before the rates, so that the ring log hears the render-rate agent's first announcement.
+    LayerMonitor mMonitor;
+    LayerRates mRates;
+
+    // The composition thread's own.
+    android::Interpolation::RenderState mState;  // reused, so that latching allocates nothing
+    bool mPresenting = true;
+    bool mLatchedByHost = false;
+    RefreshClassifier mClassifier;
 
     std::atomic<bool> mRunning{false};
     std::thread mReleaseThread;
@@ -103,13 +156,31 @@ private:
     std::condition_variable mQueueChanged;
     uint64_t mQueueChanges = 0;  // guarded by mChangeMutex
 
+    // Held across the acquisition of a frame, so that a frame is never acquired into the queue
+    // after it left it: a frame that has left is no longer among mQueuedFrames, and the one the
+    // release thread is taking out is mLeavingFrame. The removal itself waits on frame locks, which
+    // a composition may hold for as long as it likes, so it never holds this mutex: the
+    // composition thread acquires. Taken before the list's mutex.
+    std::mutex mAcquireMutex;
+    uint64_t mLeavingFrame = NO_FRAME;  // guarded by mAcquireMutex
+
     // Frames that left the list, whose release the frame timings have not recorded yet: the
     // listener cannot record them itself, since that broadcasts from inside a broadcast.
     std::mutex mReleasedMutex;
     std::vector<int> mReleasedSlots;  // guarded by mReleasedMutex
+    // Frames queued into the engine that have not left it yet; at most one per buffer.
+    std::vector<uint64_t> mQueuedFrames;  // guarded by mReleasedMutex
     std::mutex mRecordingMutex;
     std::vector<int> mReleasedScratch;  // guarded by mRecordingMutex
+
+    // The fences of frames the composition thread is done with; the buffer queue's thread drops
+    // them.
+    RetiredFences mRetiredFences;
 };
+
+// Sets up the calling thread as the host sets up its release thread: named, and with the least
+// timer slack, so that a timed release wakes when it is due.
+void configureReleaseThread();
 
 // Delivers settings as the controlling service does: an updateSettings parcel for the uid, then
 // notifyChanges. Returns updateSettings' result.

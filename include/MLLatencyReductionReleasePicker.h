@@ -33,6 +33,10 @@ public:
     void setFrameListCapacity(size_t capacity) override;
     ReleaseChoice tryRelease() override;
 
+protected:
+    // The policy with its sleep as a value: RELEASE_AFTER_SLEEP for the predicted delay.
+    ReleaseChoice decideLocked() override;
+
 private:
     // The receiver subobject of the second subscription.
     EventDispatcher::EventReceiver* primaryReceiver();

@@ -22,6 +22,10 @@ struct ReleaseChoice {
     static constexpr int32_t RELEASE = 0;         // release `frame` now
     static constexpr int32_t WAIT_FOR_EVENT = 1;  // nothing to release: wait for the next event
     static constexpr int32_t WAIT_FOR_TIME = 2;   // wait `waitTime`, then ask again
+    // Only from decideRelease(): sleep `waitTime` (the picker decides nothing meanwhile), then
+    // release the oldest frame as chooseOldestFrame() finds it then. The blocking selection makes
+    // this sleep itself, holding the picker.
+    static constexpr int32_t RELEASE_AFTER_SLEEP = 3;
 
     int32_t action = WAIT_FOR_EVENT;
     FrameItem frame;
@@ -37,6 +41,10 @@ public:
     static constexpr uint32_t EVENT_FLAGS =
             eCompositionEstimateEvent | eBufferComposedEvent | eFrameReceivedEvent;
     static constexpr nsecs_t EVENT_WAIT_TIMEOUT = 30'000'000;
+    // A computed wait never ends later than this after the next composition: one refresh period
+    // of the slowest display a compositor drives (20 Hz). By then a new composition estimate has
+    // normally woken the selection anyway; the bound only matters when a setting asks for more.
+    static constexpr nsecs_t MAX_WAIT_PAST_COMPOSITION = 50'000'000;
 
     static sp<ReleasePicker> newPickerFromMode(sp<FrameList>& frameList,
                                                sp<FrameTimingsAggregator>& timings, String8& name,
@@ -49,23 +57,42 @@ public:
     void onLastStrongRef(const void* id) override;
     virtual void setFrameListCapacity(size_t capacity);
     // Blocks until a frame is to be released, and returns it; returns the empty frame when no
-    // frame came within the event wait, and at once after the picker has stopped.
+    // frame came within the event wait, and at once after the picker has stopped. It is the
+    // blocking loop around the step that decideRelease() makes without blocking.
     virtual FrameItem selectFrameForRelease();
     // The mode's policy; runs with mMutex held.
     virtual ReleaseChoice tryRelease() = 0;
 
-protected:
-    ReleasePicker(sp<FrameList>& frameList, String8& name, const uint32_t& uid);
-
+    // One decision that never blocks: applies the events delivered so far, runs one policy step
+    // and returns what to do: release a frame now, wait for the next event (or EVENT_WAIT_TIMEOUT,
+    // whichever comes first), wait a time, or sleep and then release the oldest frame. Events that
+    // arrive while it runs are applied by the next call. After stop() it releases the empty frame.
+    // A host that keeps time itself (a simulation) calls it instead of selectFrameForRelease().
+    ReleaseChoice decideRelease();
     // Release the oldest queued frame now (the empty frame when there is none).
     ReleaseChoice chooseOldestFrame();
+    // The events after which the policy's decision can be different; the others are recorded but
+    // never wake a waiting selection.
+    uint32_t decisionEvents() const { return mDecisionEvents; }
+    // Ends every selection for good: a selection waiting for an event or a time returns the empty
+    // frame at once, later ones return it without deciding. Returns once no thread is inside
+    // selectFrameForRelease(), which takes at most the rest of a policy step (the latency picker's
+    // sleep). The last reference stops the picker too; a host stops it first so that its release
+    // thread, which holds a reference while it selects, is not left waiting.
+    void stop();
+
+protected:
+    // `decisionEvents` are the events the mode's policy reads (see decisionEvents()).
+    ReleasePicker(sp<FrameList>& frameList, String8& name, const uint32_t& uid,
+                  uint32_t decisionEvents = EVENT_FLAGS);
+
+    // The policy step without blocking: the same as tryRelease() unless the policy blocks, which it
+    // then expresses as a choice (RELEASE_AFTER_SLEEP). Runs with mMutex held.
+    virtual ReleaseChoice decideLocked() { return tryRelease(); }
     // Reads the queue's size and logs the policy step of `pickerName`.
     size_t beginTryReleaseLocked(const char* pickerName);
     // Release the oldest frame once the composed picture has reached its display time.
     ReleaseChoice chooseOldestFrameOnceDisplayedLocked();
-    // Ends every selection for good; waits until the threads inside selectFrameForRelease() have
-    // left, so that the picker can be torn down under them.
-    void stop();
 
     const sp<FrameList> mFrameList;
     uint64_t mFrameListCapacity = 3;  // guarded by mMutex
@@ -89,8 +116,11 @@ private:
     };
 
     void applyInboxLocked();
-    void wakeSelection();
-    ReleaseChoice decideLocked(uint32_t& eventsSeen);
+    void wakeSelection(bool decisionEvent);
+    // One step: the inbox, then the policy in its blocking (tryRelease) or non-blocking
+    // (decideLocked) form, then the bound on a computed wait.
+    ReleaseChoice stepLocked(bool blocking, uint32_t& eventsSeen);
+    void boundWaitLocked(ReleaseChoice& choice);
 
     // A policy step holds mMutex while it reads the frame list, and may publish events (the
     // latency-reduction delay). Events reach us with the bus's mutex held, and frame arrivals also
@@ -104,6 +134,7 @@ private:
     std::atomic<bool> mDeciding{false};  // a policy step is running
     int mActiveSelections = 0;           // guarded by mMutex
     std::condition_variable mSelectionsDone;
+    const uint32_t mDecisionEvents;
 };
 
 }  // namespace android::Interpolation

@@ -42,6 +42,11 @@ public:
     T& at(int32_t i) { return mData[slotFor(i)]; }
     const T& at(int32_t i) const { return mData[slotFor(i)]; }
 
+    // The slots in storage order and the slot of the newest element (-1 before the first push), for
+    // owners that hand out the whole storage as it lies.
+    const T* data() const { return mData.get(); }
+    int32_t headSlot() const { return mHead; }
+
     // Copies the elements at indices start..end-1 that exist, newest first, to out[0], out[1], ...
     // Returns the number written.
     uint32_t serialize(T* out, uint32_t end, uint32_t start) const {

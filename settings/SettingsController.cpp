@@ -33,25 +33,25 @@ Function readAlphaFunction(const Parcel& parcel) {
     std::vector<float> values;
     if (count >= 1) {
         // Reads past the end of the parcel give 0, so a parcel shorter than its count reads as
-        // the values it holds followed by zeros. The work and memory are bounded by what it
-        // holds: the zero pairs after the first change the curve only by repeating one
-        // corrected point, so a single (0, 0) stands for all of them.
+        // the values it holds followed by zeros, each logged and judged by the curve as it would
+        // be. That work is bounded by the parcel's own size: past as many zeros as the parcel
+        // has words, the rest stand as one more (0, 0), which changes the curve only by repeating
+        // a corrected point, and so its values not at all.
         const size_t claimed = 2 * static_cast<size_t>(count);
         const size_t held = std::min(claimed, parcel.dataAvail() / WORD);
-        values.reserve(held + 3);
+        size_t read = held + std::min(claimed - held, parcel.dataSize() / WORD);
+        read += read % 2;  // whole pairs
+        values.reserve(read + 2);
         for (size_t i = 0; i < held; i++)
             values.push_back(parcel.readFloat());
-        if (held < claimed) {
-            if (held % 2 == 1) values.push_back(0.0f);  // the y of a half-sent pair
-            const size_t missingPairs = (claimed - values.size()) / 2;
-            if (missingPairs > 0) {
-                ILOG(1,
-                     "Interpolation: alpha function of %d points ends after %d in the parcel; "
-                     "reading the missing ones as one (0.000000, 0.000000)",
-                     count, static_cast<int>(held / 2));
-                values.push_back(0.0f);
-                values.push_back(0.0f);
-            }
+        values.resize(read, 0.0f);
+        if (values.size() < claimed) {
+            ILOG(1,
+                 "Interpolation: alpha function of %d points ends after %d in the parcel; "
+                 "reading the missing ones as one (0.000000, 0.000000)",
+                 count, static_cast<int>(held / 2));
+            values.push_back(0.0f);
+            values.push_back(0.0f);
         }
         for (size_t i = 0; i + 1 < values.size(); i += 2)
             ILOG(1, "Line point: (%f, %f)", values[i], values[i + 1]);
@@ -228,10 +228,13 @@ bool SettingsController::updateSettings(unsigned int uid, const Parcel& parcel) 
     bool tunableSet = false;
     for (int32_t i = 0; i < count; i++) {
         if (parcel.dataAvail() < WORD) {
-            // Every read from here on gives 0, so each remaining entry would set parameter 0 to 0;
-            // doing it once costs nothing proportional to the count the parcel claims.
-            ILOG(1, "Interpolation: settings parcel for %d ends after %d of %d arguments",
-                 static_cast<int>(uid), i, count);
+            // Every read from here on gives 0, so each remaining entry would set parameter 0 to 0,
+            // silently; doing it once costs nothing proportional to the count the parcel claims.
+            // A count beyond the parcel's size is worth a line.
+            if (static_cast<size_t>(count - i) > parcel.dataSize() / WORD) {
+                ILOG(1, "Interpolation: settings parcel for %d ends after %d of %d arguments",
+                     static_cast<int>(uid), i, count);
+            }
             settings.gameFpsLimit = 0;
             break;
         }

@@ -25,8 +25,9 @@ BufferQueue::BufferQueue(uint32_t slots, uint32_t width, uint32_t height)
       mStates(slots, State::FREE),
       mFrameNumbers(slots, 0) {}
 
-int BufferQueue::dequeue() {
+int BufferQueue::dequeue(const std::function<void()>& onNoFreeSlot) {
     std::unique_lock lock(mMutex);
+    bool waited = false;
     while (true) {
         if (mClosed) return -1;
         auto free = std::find(mStates.begin(), mStates.end(), State::FREE);
@@ -34,6 +35,8 @@ int BufferQueue::dequeue() {
             *free = State::DEQUEUED;
             return static_cast<int>(free - mStates.begin());
         }
+        if (!waited && onNoFreeSlot) onNoFreeSlot();
+        waited = true;
         mSlotFreed.wait(lock);
     }
 }

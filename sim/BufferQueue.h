@@ -25,8 +25,9 @@ public:
 
     BufferQueue(uint32_t slots, uint32_t width, uint32_t height);
 
-    // Blocks until a slot is free; -1 once the queue is closed.
-    int dequeue();
+    // Blocks until a slot is free; -1 once the queue is closed. When none is free at first,
+    // `onNoFreeSlot` runs once, under the queue's lock, before the wait.
+    int dequeue(const std::function<void()>& onNoFreeSlot = {});
     // Queuing takes two steps, so that the compositor hears of a buffer only after the engine has
     // intercepted it, while a release that comes in between already finds the slot queued.
     void markQueued(int slot, uint64_t frameNumber);

@@ -1,9 +1,11 @@
 #include "sim/Capture.h"
 
+#include <algorithm>
 #include <cerrno>
+#include <cmath>
 #include <cstring>
 #include <fstream>
-#include <optional>
+#include <map>
 
 #include "sim/TextNumbers.h"
 
@@ -12,8 +14,9 @@ namespace verolux::sim {
 namespace {
 
 constexpr nsecs_t MAX_CAPTURE_NS = 24LL * 3600 * 1000000000;
-// Real rows are a few dozen characters; a longer line is not a capture row.
-constexpr size_t MAX_LINE_CHARS = 4096;
+constexpr double NS_PER_MS = 1e6;
+// Blank lines are skipped, but not without end (a pipe of newlines is not a capture).
+constexpr size_t MAX_LINES_PER_FRAME = 2;
 
 std::vector<std::string_view> splitCells(std::string_view line) {
     std::vector<std::string_view> cells;
@@ -26,6 +29,21 @@ std::vector<std::string_view> splitCells(std::string_view line) {
     }
 }
 
+// Reads one line without keeping more than `limit` + 1 characters of it: a longer line comes back
+// that long, so that the caller can refuse it without the rest being read. False at the end.
+bool readLine(std::istream& in, std::string& line, size_t limit) {
+    line.clear();
+    std::streambuf* buffer = in.rdbuf();
+    if (buffer == nullptr) return false;
+    for (int c = buffer->sbumpc(); c != std::char_traits<char>::eof(); c = buffer->sbumpc()) {
+        if (c == '\n') return true;
+        line.push_back(static_cast<char>(c));
+        if (line.size() > limit) return true;
+    }
+    in.setstate(std::ios::eofbit);
+    return !line.empty();
+}
+
 class CaptureParser {
 public:
     CaptureParser(const std::string& name, size_t maxFrames) : mName(name), mMaxFrames(maxFrames) {}
@@ -33,95 +51,227 @@ public:
     // Each returns the error line, or an empty string.
     std::string header(std::string_view line);
     std::string row(std::string_view line);
+    std::string finish(Capture& capture);
 
-    std::string at(std::string_view message) const {
-        return errorLine(mName + ":" + std::to_string(mLine) + ": " + std::string(message));
+    std::string at(size_t line, std::string_view message) const {
+        return errorLine(mName + ":" + std::to_string(line) + ": " + std::string(message));
     }
     void nextLine() { mLine++; }
-    Capture& capture() { return mCapture; }
+    size_t line() const { return mLine; }
 
 private:
-    std::string time(std::string_view column, std::string_view cell, nsecs_t& out) const;
+    struct Row {
+        size_t line;
+        size_t swapChain;
+        CaptureFrame frame;
+    };
+
+    std::optional<size_t> column(std::string_view name) const;
+    std::string nanoseconds(std::string_view column, std::string_view cell, nsecs_t& out) const;
+    std::string milliseconds(std::string_view column, std::string_view cell,
+                             std::optional<double>& out) const;
+    std::string presentMonRow(const std::vector<std::string_view>& cells, Row& row);
 
     const std::string& mName;
     const size_t mMaxFrames;
     size_t mLine = 0;
-    size_t mColumns = 0;
-    std::optional<size_t> mQueueColumn;
-    std::optional<size_t> mRenderDoneColumn;
-    Capture mCapture;
+    bool mPresentMon = false;
+    std::vector<std::string> mColumns;
+    std::optional<size_t> mQueueColumn;       // queue_ns or TimeInSeconds
+    std::optional<size_t> mRenderDoneColumn;  // render_done_ns or MsUntilRenderComplete
+    std::optional<size_t> mBetweenColumn;     // MsBetweenPresents
+    std::vector<size_t> mSwapChainColumns;
+    std::map<std::string, size_t> mSwapChains;  // key to index
+    double mPresentSum = 0;                     // seconds, when only MsBetweenPresents is given
+    std::vector<Row> mRows;
 };
+
+std::optional<size_t> CaptureParser::column(std::string_view name) const {
+    for (size_t i = 0; i < mColumns.size(); i++) {
+        if (mColumns[i] == name) return i;
+    }
+    return std::nullopt;
+}
 
 std::string CaptureParser::header(std::string_view line) {
     const auto cells = splitCells(line);
-    mColumns = cells.size();
     for (size_t i = 0; i < cells.size(); i++) {
         for (size_t j = 0; j < i; j++) {
-            if (cells[j] == cells[i]) return at("column " + quoted(cells[i]) + " appears twice");
+            if (cells[j] == cells[i])
+                return at(mLine, "column " + quoted(cells[i]) + " appears twice");
         }
-        if (cells[i] == "queue_ns") mQueueColumn = i;
-        if (cells[i] == "render_done_ns") mRenderDoneColumn = i;
+        mColumns.emplace_back(cells[i]);
     }
-    if (!mQueueColumn) return at("the header names no queue_ns column");
+    mBetweenColumn = column("MsBetweenPresents");
+    mPresentMon = mBetweenColumn.has_value();
+    if (!mPresentMon) {
+        mQueueColumn = column("queue_ns");
+        mRenderDoneColumn = column("render_done_ns");
+        if (!mQueueColumn) {
+            return at(mLine,
+                      "the header names neither queue_ns nor PresentMon's MsBetweenPresents");
+        }
+        return {};
+    }
+    mQueueColumn = column("TimeInSeconds");
+    mRenderDoneColumn = column("MsUntilRenderComplete");
+    for (const char* key : {"Application", "ProcessID", "SwapChainAddress"}) {
+        if (const auto index = column(key)) mSwapChainColumns.push_back(*index);
+    }
     return {};
 }
 
-std::string CaptureParser::time(std::string_view column, std::string_view cell, nsecs_t& out) const {
+std::string CaptureParser::nanoseconds(std::string_view column, std::string_view cell,
+                                       nsecs_t& out) const {
     const auto value = parseInteger(cell);
-    if (!value) return at(std::string(column) + " is not a number");
+    if (!value) return at(mLine, std::string(column) + " is not a number");
     if (*value < 0 || *value > MAX_CAPTURE_NS) {
-        return at(std::string(column) + " is out of range (0 to 24 hours in nanoseconds)");
+        return at(mLine, std::string(column) + " is out of range (0 to 24 hours in nanoseconds)");
     }
     out = *value;
     return {};
 }
 
-std::string CaptureParser::row(std::string_view line) {
-    const auto cells = splitCells(line);
-    if (cells.size() != mColumns) {
-        return at("expected " + std::to_string(mColumns) + " cells, found " +
-                  std::to_string(cells.size()));
+std::string CaptureParser::milliseconds(std::string_view column, std::string_view cell,
+                                        std::optional<double>& out) const {
+    out.reset();
+    if (cell.empty() || cell == "NA") return {};
+    const auto value = parseNumber(cell);
+    if (!value) return at(mLine, std::string(column) + " is not a number");
+    if (*value < 0 || *value > MAX_CAPTURE_NS / NS_PER_MS) {
+        return at(mLine, std::string(column) + " is out of range (0 to 24 hours)");
     }
-    if (mCapture.frames.size() == mMaxFrames) {
-        return at("more than " + std::to_string(mMaxFrames) + " frames");
-    }
-    CaptureFrame frame;
-    if (cells[*mQueueColumn].empty()) return at("queue_ns is empty");
-    if (std::string error = time("queue_ns", cells[*mQueueColumn], frame.queueTime);
+    out = *value;
+    return {};
+}
+
+std::string CaptureParser::presentMonRow(const std::vector<std::string_view>& cells, Row& row) {
+    std::optional<double> between;
+    if (std::string error = milliseconds("MsBetweenPresents", cells[*mBetweenColumn], between);
         !error.empty()) {
         return error;
     }
-    if (!mCapture.frames.empty() && frame.queueTime < mCapture.frames.back().queueTime) {
-        return at("queue_ns is earlier than the previous frame's");
-    }
-    if (mRenderDoneColumn && !cells[*mRenderDoneColumn].empty()) {
-        if (std::string error =
-                    time("render_done_ns", cells[*mRenderDoneColumn], frame.renderDoneTime);
+    double seconds = 0;
+    if (mQueueColumn) {
+        std::optional<double> ms;
+        if (std::string error = milliseconds("TimeInSeconds", cells[*mQueueColumn], ms);
             !error.empty()) {
             return error;
         }
-        if (frame.renderDoneTime < frame.queueTime) {
-            return at("render_done_ns is earlier than queue_ns");
+        if (!ms) return at(mLine, "TimeInSeconds is empty");
+        seconds = *ms;  // same range check, in seconds
+    } else {
+        mPresentSum += between.value_or(0) / 1e3;
+        seconds = mPresentSum;
+    }
+    if (seconds * 1e9 > static_cast<double>(MAX_CAPTURE_NS)) {
+        return at(mLine, "TimeInSeconds is out of range (0 to 24 hours)");
+    }
+    row.frame.queueTime = std::llround(seconds * 1e9);
+    if (mRenderDoneColumn) {
+        std::optional<double> render;
+        if (std::string error =
+                    milliseconds("MsUntilRenderComplete", cells[*mRenderDoneColumn], render);
+            !error.empty()) {
+            return error;
+        }
+        if (render)
+            row.frame.renderDoneTime = row.frame.queueTime + std::llround(*render * NS_PER_MS);
+    }
+    std::string key;
+    for (size_t index : mSwapChainColumns)
+        key.append(cells[index]).push_back(',');
+    row.swapChain = mSwapChains.emplace(key, mSwapChains.size()).first->second;
+    return {};
+}
+
+std::string CaptureParser::row(std::string_view line) {
+    const auto cells = splitCells(line);
+    if (cells.size() != mColumns.size()) {
+        return at(mLine, "expected " + std::to_string(mColumns.size()) + " cells, found " +
+                                 std::to_string(cells.size()));
+    }
+    if (mRows.size() == mMaxFrames)
+        return at(mLine, "more than " + std::to_string(mMaxFrames) + " frames");
+    Row row{mLine, 0, {}};
+    if (mPresentMon) {
+        if (std::string error = presentMonRow(cells, row); !error.empty()) return error;
+        mRows.push_back(row);
+        return {};
+    }
+    if (cells[*mQueueColumn].empty()) return at(mLine, "queue_ns is empty");
+    if (std::string error = nanoseconds("queue_ns", cells[*mQueueColumn], row.frame.queueTime);
+        !error.empty()) {
+        return error;
+    }
+    if (mRenderDoneColumn && !cells[*mRenderDoneColumn].empty()) {
+        if (std::string error = nanoseconds("render_done_ns", cells[*mRenderDoneColumn],
+                                            row.frame.renderDoneTime);
+            !error.empty()) {
+            return error;
+        }
+        if (row.frame.renderDoneTime < row.frame.queueTime) {
+            return at(mLine, "render_done_ns is earlier than queue_ns");
         }
     }
-    mCapture.frames.push_back(frame);
+    mRows.push_back(row);
+    return {};
+}
+
+std::string CaptureParser::finish(Capture& capture) {
+    capture.format = mPresentMon ? "PresentMon" : "frames";
+    // The game's swap chain is the one that presented most.
+    std::vector<size_t> presents(std::max<size_t>(1, mSwapChains.size()), 0);
+    for (const Row& row : mRows)
+        presents[row.swapChain]++;
+    const size_t game = std::max_element(presents.begin(), presents.end()) - presents.begin();
+    const char* queueName = mPresentMon ? "TimeInSeconds" : "queue_ns";
+    for (const Row& row : mRows) {
+        if (row.swapChain != game) continue;
+        if (!capture.frames.empty() && row.frame.queueTime < capture.frames.back().queueTime) {
+            return at(row.line, std::string(queueName) + " is earlier than the previous frame's");
+        }
+        capture.frames.push_back(row.frame);
+    }
+    if (capture.frames.empty()) return errorLine(mName + ": no frames after the header");
+    const nsecs_t first = capture.frames.front().queueTime;
+    for (CaptureFrame& frame : capture.frames) {
+        frame.queueTime -= first;
+        if (frame.renderDoneTime >= 0) frame.renderDoneTime -= first;
+    }
     return {};
 }
 
 }  // namespace
+
+nsecs_t Capture::meanInterval() const {
+    if (frames.size() < 2 || span() <= 0) return 1'000'000'000;
+    return span() / static_cast<nsecs_t>(frames.size() - 1);
+}
+
+double Capture::fpsOverFirst(size_t count) const {
+    if (count < 2 || count >= frames.size()) return fps();
+    const nsecs_t span = frames[count - 1].queueTime - frames.front().queueTime;
+    return span > 0 ? 1e9 * static_cast<double>(count - 1) / static_cast<double>(span) : fps();
+}
 
 Result<Capture> parseCapture(std::istream& in, const std::string& name, size_t maxFrames) {
     using R = Result<Capture>;
     CaptureParser parser(name, maxFrames);
     std::string line;
     bool haveHeader = false;
-    while (std::getline(in, line)) {
+    while (readLine(in, line, MAX_LINE_CHARS)) {
         parser.nextLine();
         if (line.size() > MAX_LINE_CHARS) {
-            return R::failure(parser.at("line is longer than " + std::to_string(MAX_LINE_CHARS) +
-                                        " characters"));
+            return R::failure(parser.at(
+                    parser.line(),
+                    "line is longer than " + std::to_string(MAX_LINE_CHARS) + " characters"));
+        }
+        if (parser.line() > MAX_LINES_PER_FRAME * maxFrames + 1) {
+            return R::failure(parser.at(parser.line(), "too many lines for a capture"));
         }
         std::string_view text = line;
+        if (!text.empty() && text.back() == '\r') text.remove_suffix(1);
         if (!haveHeader) {
             constexpr std::string_view BOM = "\xEF\xBB\xBF";
             if (text.substr(0, BOM.size()) == BOM) text.remove_prefix(BOM.size());
@@ -138,15 +288,7 @@ Result<Capture> parseCapture(std::istream& in, const std::string& name, size_t m
         return R::failure(errorLine(name + ": empty, expected a header line naming queue_ns"));
     }
     R result;
-    result.value = std::move(parser.capture());
-    if (result.value.frames.empty()) {
-        return R::failure(errorLine(name + ": no frames after the header"));
-    }
-    const nsecs_t first = result.value.frames.front().queueTime;
-    for (CaptureFrame& frame : result.value.frames) {
-        frame.queueTime -= first;
-        if (frame.renderDoneTime >= 0) frame.renderDoneTime -= first;
-    }
+    if (std::string error = parser.finish(result.value); !error.empty()) return R::failure(error);
     return result;
 }
 

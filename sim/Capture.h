@@ -4,6 +4,7 @@
 
 #include <cstddef>
 #include <istream>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -11,19 +12,27 @@
 
 namespace verolux::sim {
 
-// A frame-time capture, replayed by verolux-sim --capture instead of the generated game.
+// A frame-time capture, replayed by verolux-sim --capture instead of the generated game. Two
+// formats are read, told apart by their header line:
 //
-// Format: CSV, cells separated by commas, no quoting, spaces around cells ignored, LF or CRLF.
-//   - Line 1 names the columns. queue_ns is required, render_done_ns optional; any other column
-//     (frame, display_ns, ...) is ignored. Names are case-sensitive and appear once each.
-//   - Every further non-blank line is one frame, in queue order, with one cell per column.
-//   - Values are integer nanoseconds relative to the first frame, from 0 to 24 hours: queue_ns is
-//     when the game queued the frame and never decreases from row to row; render_done_ns is when
-//     its GPU work completed, at or after queue_ns, or empty when unknown.
-//   - At most MAX_CAPTURE_FRAMES frames.
-// This is the format of the *.frames.csv captures: frame,queue_ns,render_done_ns,display_ns.
+// The project's own (*.frames.csv: frame,queue_ns,render_done_ns,display_ns):
+//   - queue_ns is required, render_done_ns optional; other columns are ignored;
+//   - values are integer nanoseconds, from 0 to 24 hours: queue_ns when the game queued the
+//     frame, never decreasing from row to row; render_done_ns when its GPU work completed, at or
+//     after queue_ns, or empty when unknown.
+//
+// PresentMon's (a header naming MsBetweenPresents):
+//   - TimeInSeconds gives the present times; without it they add up from MsBetweenPresents;
+//   - MsUntilRenderComplete, when present, gives the render times ("NA" or empty: unknown);
+//   - the file may hold several swap chains (Application, ProcessID, SwapChainAddress): the one
+//     with the most presents is the game's and the only one replayed.
+//
+// Both: CSV, cells separated by commas, no quoting, spaces around cells ignored, LF or CRLF,
+// column names case-sensitive and once each, lines of at most MAX_LINE_CHARS, at most
+// MAX_CAPTURE_FRAMES frames.
 
 constexpr size_t MAX_CAPTURE_FRAMES = 1'000'000;
+constexpr size_t MAX_LINE_CHARS = 4096;
 
 struct CaptureFrame {
     nsecs_t queueTime = 0;
@@ -31,8 +40,18 @@ struct CaptureFrame {
 };
 
 struct Capture {
+    std::string format;  // "frames" or "PresentMon"
     // Shifted so that the first frame is queued at 0.
     std::vector<CaptureFrame> frames;
+
+    // The mean interval between frames (the span over the intervals; 1 s for a single frame).
+    nsecs_t meanInterval() const;
+    // The rate the game ran at: 1 / the mean interval.
+    double fps() const { return 1e9 / static_cast<double>(meanInterval()); }
+    // The rate over the first `count` frames, what a run that replayed only those asked of the
+    // game; the whole capture's beyond its end.
+    double fpsOverFirst(size_t count) const;
+    nsecs_t span() const { return frames.empty() ? 0 : frames.back().queueTime; }
 };
 
 // name stands for the input in error lines ("name:7: queue_ns is not a number").

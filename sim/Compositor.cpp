@@ -2,6 +2,8 @@
 
 #include <time.h>
 
+#include <algorithm>
+#include <array>
 #include <chrono>
 #include <cmath>
 
@@ -12,6 +14,8 @@ using android::Interpolation::RenderState;
 
 namespace {
 
+constexpr nsecs_t SECOND = 1'000'000'000;
+
 nsecs_t threadCpuTime() {
     timespec ts{};
     clock_gettime(CLOCK_THREAD_CPUTIME_ID, &ts);
@@ -20,12 +24,15 @@ nsecs_t threadCpuTime() {
 
 }  // namespace
 
-Compositor::Compositor(nsecs_t refreshPeriod, uint32_t width, std::vector<DisplayedLayer> layers)
+Compositor::Compositor(nsecs_t refreshPeriod, uint32_t width, std::vector<DisplayedLayer> layers,
+                       double clientCompositionShare, uint64_t seed)
     : mRefreshPeriod(refreshPeriod),
       mWidth(width),
       mLayers(std::move(layers)),
       mScreens(mLayers.size()),
-      mAccumulator(size_t{width} * 3) {
+      mAccumulator(size_t{width} * 3),
+      mClientCompositionShare(clientCompositionShare),
+      mRandom(seed) {
     for (Screen& screen : mScreens)
         screen.scanline.assign(size_t{width} * 3, 0);
 }
@@ -49,29 +56,35 @@ void Compositor::stop() {
 
 void Compositor::run(nsecs_t firstVsync) {
     nsecs_t vsync = firstVsync;
-    for (uint64_t index = 0;; index++) {
+    for (Screen& screen : mScreens)
+        screen.nextStatistics = firstVsync + SECOND;
+    std::uniform_real_distribution<double> draw(0.0, 1.0);
+    while (true) {
         {
             std::unique_lock lock(mMutex);
             const auto deadline =
                     std::chrono::steady_clock::time_point(std::chrono::nanoseconds(vsync));
             if (mStopped.wait_until(lock, deadline, [this] { return mStopping; })) return;
         }
-        // The display's present fence, signalled when the refresh reaches the screen.
-        const auto presentFence = std::make_shared<android::FenceTime>(
-                android::Fence::createSignalled(vsync + mRefreshPeriod));
+        const auto index = static_cast<uint64_t>((vsync - firstVsync) / mRefreshPeriod);
+        const nsecs_t present = vsync + mRefreshPeriod;
+        const auto presentFence =
+                std::make_shared<android::FenceTime>(android::Fence::createSignalled(present));
+        const bool clientComposed =
+                mClientCompositionShare > 0 && draw(mRandom) < mClientCompositionShare;
         for (size_t layer = 0; layer < mLayers.size(); layer++) {
-            refresh(layer, index, vsync, presentFence);
+            refresh(layer, index, vsync, present, presentFence, clientComposed);
         }
         vsync += mRefreshPeriod;
-        // A display thread that fell behind skips the vsyncs it missed, as a real one would.
         const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
         while (vsync < now)
             vsync += mRefreshPeriod;
     }
 }
 
-void Compositor::refresh(size_t layerIndex, uint64_t index, nsecs_t vsync,
-                         const std::shared_ptr<android::FenceTime>& presentFence) {
+void Compositor::refresh(size_t layerIndex, uint64_t index, nsecs_t vsync, nsecs_t present,
+                         const std::shared_ptr<android::FenceTime>& presentFence,
+                         bool clientComposed) {
     const DisplayedLayer& layer = mLayers[layerIndex];
     LayerRecorder& recorder = *layer.recorder;
     layer.queue->acquireReady([&](const BufferQueue::QueuedBuffer& queued) {
@@ -85,30 +98,45 @@ void Compositor::refresh(size_t layerIndex, uint64_t index, nsecs_t vsync,
     RefreshRecord record;
     record.index = index;
     record.vsyncTime = vsync;
-    record.displayTime = vsync;
+    record.presentTime = present;
 
     const nsecs_t cpuBefore = threadCpuTime();
-    const RenderState state = layer.host->compose(vsync);
+    const bool presents = layer.host->onVsync(vsync);
+    const RenderState& state = presents ? layer.host->compose(vsync) : mNothing;
     const nsecs_t cpuComposed = threadCpuTime();
-    record.kind = recorder.takeCompositionKind();
+    record.refused = !presents;
+    record.clientComposed = clientComposed;
 
     // With nothing to draw, the previous picture stays on screen.
     Screen& screen = mScreens[layerIndex];
-    blend(state, record.items, screen, recorder);
-    record.contentTime = screen.contentTime;
-    record.delay = recorder.currentDelay();
+    blend(state, record, screen);
+    recorder.composed(record);
 
     const nsecs_t cpuReturning = threadCpuTime();
-    layer.host->onCompositionDone(state, vsync, presentFence);
+    layer.host->onCompositionDone(state, vsync, presentFence,
+                                  clientComposed ? host::LayerHost::CompositionType::CLIENT
+                                                 : host::LayerHost::CompositionType::DEVICE);
     record.cpuTime = (cpuComposed - cpuBefore) + (threadCpuTime() - cpuReturning);
-    recorder.refreshed(std::move(record), screen.scanline);
+    record.queueLength = static_cast<uint32_t>(layer.host->frameList()->size());
+    record.scanline = screen.scanline;
+    const host::LayerHost::Status status = layer.host->status();
+    record.interpolating = status.interpolating;
+    record.refreshRate = status.refreshRate;
+    record.gameRateLimit = status.gameRateLimit;
+    record.gameRateLimitApplied = status.gameRateLimitApplied;
+    recorder.refreshed(std::move(record));
+
+    if (vsync >= screen.nextStatistics) {
+        recorder.statistics({vsync, layer.host->statistics(vsync)});
+        screen.nextStatistics += SECOND * ((vsync - screen.nextStatistics) / SECOND + 1);
+    }
 }
 
-void Compositor::blend(const RenderState& state, std::vector<ComposedItem>& items, Screen& screen,
-                       LayerRecorder& recorder) {
+void Compositor::blend(const RenderState& state, RefreshRecord& record, Screen& screen) {
     // Each item covers what is below it by its alpha; the bottom item is opaque.
-    std::vector<float> weights(state.items.size(), 0.0f);
-    for (size_t i = 0; i < state.items.size(); i++) {
+    const size_t count = std::min(state.items.size(), RefreshRecord::MAX_ITEMS);
+    std::array<float, RefreshRecord::MAX_ITEMS> weights{};
+    for (size_t i = 0; i < count; i++) {
         const RenderItem& item = state.items[i];
         const float cover = i == 0 || item.blend == 0 ? 1.0f : item.alpha;
         for (size_t below = 0; below < i; below++)
@@ -117,17 +145,13 @@ void Compositor::blend(const RenderState& state, std::vector<ComposedItem>& item
     }
 
     bool drawn = false;
-    double content = 0;
-    double contentWeight = 0;
     std::fill(mAccumulator.begin(), mAccumulator.end(), 0.0f);
-    for (size_t i = 0; i < state.items.size(); i++) {
+    for (size_t i = 0; i < count; i++) {
         const RenderItem& item = state.items[i];
-        ComposedItem composed;
+        ComposedItem& composed = record.items[record.itemCount++];
         composed.frameNumber = item.frame.isEmpty() ? 0 : item.frame.mIndex;
         composed.alpha = item.alpha;
-        composed.blend = item.blend;
         composed.weight = item.frame.isEmpty() ? 0.0f : weights[i];
-        items.push_back(composed);
         if (item.frame.isEmpty() || weights[i] <= 0.0f) continue;
 
         android::GraphicBuffer& buffer = *item.frame.mGraphicBuffer;
@@ -144,14 +168,11 @@ void Compositor::blend(const RenderState& state, std::vector<ComposedItem>& item
         }
         buffer.unlock();
         drawn = true;
-        content += weights[i] * static_cast<double>(recorder.contentTimeOf(item.frame.mIndex));
-        contentWeight += weights[i];
     }
     if (!drawn) return;
     for (size_t i = 0; i < mAccumulator.size(); i++) {
         screen.scanline[i] = static_cast<uint8_t>(std::lround(std::min(255.0f, mAccumulator[i])));
     }
-    screen.contentTime = content / contentWeight;
 }
 
 }  // namespace verolux::sim

@@ -10,6 +10,7 @@ namespace verolux::sim {
 namespace {
 
 constexpr nsecs_t MS = 1'000'000;
+constexpr nsecs_t SECOND = 1'000'000'000;
 // The bar crosses the picture in two seconds of game time: a few pixels per refresh, so that even
 // pacing draws a straight edge in the space-time picture and uneven pacing draws steps.
 constexpr nsecs_t CROSSING_TIME = 2'000'000'000;
@@ -82,28 +83,27 @@ void Game::run(nsecs_t startTime) {
     std::normal_distribution<double> jitter(0.0, mConfig.jitterMs);
     std::normal_distribution<double> renderTime(mConfig.renderMs, mConfig.renderMs / 4);
     const nsecs_t period = toNanos(1000.0 / mConfig.fps);
+    const std::vector<CaptureFrame>* capture =
+            mConfig.capture != nullptr ? &mConfig.capture->frames : nullptr;
 
     nsecs_t frameStart = startTime;
+    size_t replayed = 0;  // the capture frame to play next
     for (uint64_t number = 1;; number++) {
-        nsecs_t render;
-        if (mConfig.capture != nullptr) {
-            if (number > mConfig.capture->frames.size()) break;
-            const CaptureFrame& frame = mConfig.capture->frames[number - 1];
-            frameStart = startTime + frame.queueTime;
-            render = frame.renderDoneTime >= 0 ? frame.renderDoneTime - frame.queueTime
-                                               : toNanos(mConfig.renderMs);
-        } else {
-            render = std::max<nsecs_t>(0, toNanos(renderTime(random)));
+        nsecs_t render = std::max<nsecs_t>(0, toNanos(renderTime(random)));
+        if (capture != nullptr) {
+            const CaptureFrame& frame = (*capture)[replayed];
+            if (frame.renderDoneTime >= 0) render = frame.renderDoneTime - frame.queueTime;
         }
         if (!sleepUntil(frameStart)) return;
 
-        const int slot = mQueue.dequeue();
+        const nsecs_t requestTime = systemTime(SYSTEM_TIME_MONOTONIC);
+        const int slot = mQueue.dequeue([this] { mHost.onBufferBackpressure(); });
         if (slot < 0) return;
         const nsecs_t dequeueTime = systemTime(SYSTEM_TIME_MONOTONIC);
         // A game that had to wait for a buffer simulates its world from when it got one.
         const nsecs_t contentTime = std::max(frameStart, dequeueTime);
-        mRecorder.frameDequeued(number, slot, contentTime, dequeueTime);
-        mHost.onBufferDequeued(slot, frameStart, dequeueTime);
+        mRecorder.frameDequeued(number, slot, contentTime, requestTime, dequeueTime);
+        mHost.onBufferDequeued(slot, requestTime, dequeueTime);
 
         const android::sp<android::GraphicBuffer>& buffer = mQueue.buffer(slot);
         draw(*buffer, contentTime);
@@ -116,10 +116,25 @@ void Game::run(nsecs_t startTime) {
         mHost.onBufferQueued(number, slot, buffer, queueTime, fence);
         mQueue.makeAcquirable({slot, number, queueTime, fence});
 
-        if (mConfig.capture == nullptr) {
-            const nsecs_t interval = std::max(MS, period + toNanos(jitter(random)));
-            // A game that fell behind starts its next frame at once instead of bursting.
-            frameStart = std::max(frameStart + interval, systemTime(SYSTEM_TIME_MONOTONIC));
+        nsecs_t interval = std::max(MS, period + toNanos(jitter(random)));
+        if (capture != nullptr) {
+            replayed++;
+            if (replayed == capture->size()) {
+                if (!mConfig.loop) {
+                    mCaptureEnd = queueTime;
+                    break;
+                }
+                replayed = 0;
+                interval = mConfig.capture->meanInterval();
+            } else {
+                interval = (*capture)[replayed].queueTime - (*capture)[replayed - 1].queueTime;
+            }
+        }
+        frameStart = std::max(frameStart + interval, systemTime(SYSTEM_TIME_MONOTONIC));
+        // Held to the game-rate limit, as the controlling service would hold it.
+        const host::LayerHost::Status status = mHost.status();
+        if (status.gameRateLimitApplied) {
+            frameStart = std::max(frameStart, requestTime + SECOND / status.gameRateLimit);
         }
     }
     // A finished capture leaves the game idle until the run ends.

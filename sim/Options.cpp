@@ -22,12 +22,16 @@ struct RealOption {
 };
 
 const RealOption REAL_OPTIONS[] = {
-        {"--fps", &Options::fps, 0, false, 1000, "must be greater than 0 and at most 1000"},
+        // A slower game would not show a frame within a run; the bound keeps the period finite.
+        {"--fps", &Options::fps, 0.1, true, 1000, "must be between 0.1 and 1000"},
         {"--hz", &Options::hz, 1, true, 1000, "must be between 1 and 1000"},
         {"--jitter-ms", &Options::jitterMs, 0, true, 1000, "must be between 0 and 1000"},
         {"--render-ms", &Options::renderMs, 0, true, 1000, "must be between 0 and 1000"},
         {"--duration", &Options::durationSec, 0, false, 3600,
          "must be greater than 0 and at most 3600 seconds"},
+        {"--picture-at", &Options::pictureAtSec, 0, true, 3600, "must be between 0 and 3600"},
+        {"--client-composition", &Options::clientCompositionShare, 0, true, 1,
+         "must be between 0 and 1"},
 };
 
 struct WholeOption {
@@ -40,6 +44,8 @@ struct WholeOption {
 const WholeOption WHOLE_OPTIONS[] = {
         {"--mode", &Options::mode, 0, 5},
         {"--slots", &Options::slots, 2, 64},
+        {"--game-width", &Options::gameWidth, 1, 16384},
+        {"--game-height", &Options::gameHeight, 1, 16384},
         {"--width", &Options::width, 16, 4096},
 };
 
@@ -76,6 +82,7 @@ std::string applyReal(const RealOption& option, std::string_view text, Options& 
                          formatNumber(*value) + ")");
     }
     options.*option.field = *value;
+    if (option.field == &Options::durationSec) options.durationGiven = true;
     return {};
 }
 
@@ -143,6 +150,8 @@ bool applyValueOption(std::string_view name, std::string_view text, Options& opt
 bool applyFlag(std::string_view name, Options& options) {
     if (name == "--help" || name == "-h") {
         options.help = true;
+    } else if (name == "--loop") {
+        options.loop = true;
     } else if (name == "--no-reference") {
         options.reference = false;
     } else if (name == "--quiet") {
@@ -192,30 +201,56 @@ Result<Options> parseOptions(int argc, const char* const* argv) {
 }
 
 std::string usage() {
-    return R"(Usage: verolux-sim [options]
-Plays a simulated game and display in real time against the library and writes what happened.
+    std::string text = R"(Usage: verolux-sim [options]
+Plays a simulated game and display in real time against the library, and the same game without
+interpolation (mode 2) beside it, and reports what the screen showed.
 
-Game (ignored with --capture):
-  --fps F            frames per second the game queues (default 30, at most 1000)
-  --jitter-ms J      standard deviation of the queue times, ms (default 1)
+Game:
+  --fps F            frames per second the game queues (default 30, 0.1 to 1000)
+  --jitter-ms J      standard deviation of the frame intervals, ms (default 1)
   --render-ms R      mean GPU time of a frame, ms (default 8)
   --seed N           seed of the jitter and render times (default 1)
-  --capture FILE     replay a frame-time capture instead (see sim/captures/README.md)
+  --capture FILE     replay a frame-time capture instead: the project's *.frames.csv or a
+                     PresentMon CSV (see sim/captures/README.md); the run lasts until it ends
+  --loop             replay the capture until --duration is over
+  --game-width W     the game's resolution, for the buffers' memory (default 1920 x 1080)
+  --game-height H
 Display and library:
   --hz H             display refresh rate (default 60, 1 to 1000)
-  --mode M           interpolation mode 0 to 5 (default 0)
-  --slots N          buffer-queue slots, 2 to 64 (default 3)
-  --settings FILE    settings as a JSON object of settings keys
+  --mode M           interpolation mode (default 0):
+                       0 retime, 1 fill-in, 2 no interpolation, 3 just in time,
+                       4 unlimited, 5 latency reduction
+  --slots N          buffers of the game's queue, 2 to 64 (default: enough for the display
+                     delay at the refresh rate; the queueSize setting fixes it too)
+  --client-composition SHARE
+                     share of compositions, 0 to 1, that fall back to client (GPU)
+                     composition, drawn from the seed (default 0)
+  --settings FILE    settings as a JSON object of the keys below
   --set KEY=VALUE    one setting, after those of --settings; may repeat
-                     (e.g. --set delayMs=48 --set alphaFunction=0,0,0.5,1,1,1)
+                     (e.g. --set delayMs=48 --set alphaFunction=0,0,0.5,1,1,1); gameFpsLimit
+                     is the refresh rate unless set (interpolation is on from 1 upwards);
+                     gfpsOffsetEnabled=1 holds the game to the game-rate limit
 Run and output:
-  --duration S       seconds to run (default 10, at most 3600)
+  --duration S       seconds to run (default 10, or the capture's length; at most 3600)
   --out DIR          output folder (default sim-out)
   --width W          width of the space-time picture in pixels, 16 to 4096 (default 320)
+  --picture-at S     start of the space-time picture's 2 s window (default 1)
   --no-reference     skip the mode-2 run on the same game
   --quiet            print nothing but errors
   --help             print this and exit
+
+Settings keys (per game, then process-wide):
 )";
+    std::string line = " ";
+    for (const SettingKey& key : settingKeys()) {
+        if (line.size() + key.name.size() + 1 > 96) {
+            text += line + "\n";
+            line = " ";
+        }
+        line += " ";
+        line += key.name;
+    }
+    return text + line + "\n";
 }
 
 Result<std::vector<host::SettingValue>> gatherSettings(const Options& options) {

@@ -16,9 +16,15 @@ struct Options {
     double jitterMs = 1;
     double renderMs = 8;  // mean GPU time of a frame
     double hz = 60;
+    double clientCompositionShare = 0;  // compositions that fall back to client composition
     uint32_t mode = 0;
-    uint32_t slots = 3;  // buffer-queue slots
+    uint32_t slots = 0;  // buffer-queue slots; 0: sized by the reference host
     double durationSec = 10;
+    bool durationGiven = false;  // without it, a capture plays to its end
+    bool loop = false;           // replay the capture until the duration is over
+    uint32_t gameWidth = 1920;   // the game's resolution, for the buffers' memory
+    uint32_t gameHeight = 1080;
+    double pictureAtSec = 1;  // start of the space-time picture's window
     std::string outDir = "sim-out";
     std::string capturePath;                    // empty: the generator above plays the game
     std::string settingsPath;                   // empty: no settings file

@@ -2,6 +2,8 @@
 
 #include <json/json.h>
 
+#include <algorithm>
+#include <cctype>
 #include <cerrno>
 #include <cfloat>
 #include <cmath>
@@ -10,6 +12,8 @@
 #include <limits>
 #include <memory>
 #include <sstream>
+#include <type_traits>
+#include <variant>
 
 #include "sim/TextNumbers.h"
 
@@ -24,6 +28,7 @@ using Points = std::vector<SettingValue::Point>;
 constexpr std::streamoff MAX_SETTINGS_FILE_BYTES = 1 << 20;
 constexpr int32_t MODE_ID = 7;
 constexpr int64_t MAX_MODE = 5;
+constexpr int MAX_SETTINGS_DEPTH = 16;
 
 std::string describe(const Json::Value& value) {
     if (value.isString()) return quoted(value.asString());
@@ -72,6 +77,44 @@ std::string checkPoints(const SettingKey& key, const std::vector<double>& flat,
     }
     out = std::move(points);
     return {};
+}
+
+// Edits (insertions, deletions, substitutions, case ignored) between two short names.
+size_t editDistance(std::string_view a, std::string_view b) {
+    std::vector<size_t> row(b.size() + 1);
+    for (size_t j = 0; j <= b.size(); j++)
+        row[j] = j;
+    for (size_t i = 1; i <= a.size(); i++) {
+        size_t diagonal = row[0];
+        row[0] = i;
+        for (size_t j = 1; j <= b.size(); j++) {
+            const size_t above = row[j];
+            const bool same = std::tolower(static_cast<unsigned char>(a[i - 1])) ==
+                              std::tolower(static_cast<unsigned char>(b[j - 1]));
+            row[j] = std::min({row[j] + 1, row[j - 1] + 1, diagonal + (same ? 0 : 1)});
+            diagonal = above;
+        }
+    }
+    return row[b.size()];
+}
+
+// "unknown settings key "x"", and the closest key when one is near enough to be a typo.
+std::string unknownKey(std::string_view name) {
+    // Typos are a few edits, about one in three letters; anything further is another word.
+    const SettingKey* closest = nullptr;
+    size_t best = std::max<size_t>(1, name.size() / 3) + 1;
+    if (name.size() <= 64) {
+        for (const SettingKey& key : settingKeys()) {
+            const size_t edits = editDistance(name, key.name);
+            if (edits < best) {
+                best = edits;
+                closest = &key;
+            }
+        }
+    }
+    std::string text = "unknown settings key " + quoted(name);
+    if (closest != nullptr) text += " (did you mean \"" + std::string(closest->name) + "\"?)";
+    return text;
 }
 
 std::string expected(const SettingKey& key, const std::string& got) {
@@ -254,7 +297,7 @@ Result<SettingValue> parseSettingAssignment(std::string_view assignment) {
     }
     const std::string_view name = trim(assignment.substr(0, equals));
     const SettingKey* key = findSettingKey(name);
-    if (key == nullptr) return R::failure(errorLine("--set: unknown settings key " + quoted(name)));
+    if (key == nullptr) return R::failure(errorLine("--set: " + unknownKey(name)));
     R result;
     result.value.id = key->id;
     std::string error = valueFromText(*key, trim(assignment.substr(equals + 1)), result.value.value);
@@ -268,10 +311,20 @@ Result<std::vector<SettingValue>> parseSettingsJson(std::string_view text, std::
     Json::CharReaderBuilder builder;
     Json::CharReaderBuilder::strictMode(&builder.settings_);
     builder["allowComments"] = true;
+    // Settings nest three levels at most (object, curve, point).
+    builder["stackLimit"] = MAX_SETTINGS_DEPTH;
     const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
     Json::Value root;
     std::string errors;
-    if (!reader->parse(text.data(), text.data() + text.size(), &root, &errors)) {
+    bool parsed = false;
+    try {
+        parsed = reader->parse(text.data(), text.data() + text.size(), &root, &errors);
+    } catch (const Json::Exception&) {
+        // The reader throws instead of reporting when the nesting exceeds its stack limit.
+        return R::failure(errorLine(prefix + "invalid JSON: nested deeper than " +
+                                    std::to_string(MAX_SETTINGS_DEPTH) + " levels"));
+    }
+    if (!parsed) {
         return R::failure(errorLine(prefix + "invalid JSON: " + firstJsonError(errors)));
     }
     if (!root.isObject()) {
@@ -281,7 +334,7 @@ Result<std::vector<SettingValue>> parseSettingsJson(std::string_view text, std::
     for (const std::string& name : root.getMemberNames()) {
         const SettingKey* key = findSettingKey(name);
         if (key == nullptr) {
-            return R::failure(errorLine(prefix + "unknown settings key " + quoted(name)));
+            return R::failure(errorLine(prefix + unknownKey(name)));
         }
         SettingValue entry{key->id, {}};
         std::string error = valueFromJson(*key, root[name], entry.value);
@@ -309,6 +362,40 @@ Result<std::vector<SettingValue>> readSettingsFile(const std::string& path) {
     }
     if (in.bad()) return R::failure(errorLine("cannot read settings file " + path));
     return parseSettingsJson(text.str(), path);
+}
+
+int32_t logLevelOf(const std::vector<SettingValue>& settings) {
+    constexpr int32_t LOG_LEVEL_ID = 100;
+    int32_t level = 0;
+    for (const SettingValue& setting : settings) {
+        if (const auto* value = std::get_if<int32_t>(&setting.value);
+            value != nullptr && setting.id == LOG_LEVEL_ID) {
+            level = *value;
+        }
+    }
+    return level;
+}
+
+std::string describeSetting(const SettingValue& setting) {
+    std::string name = "id " + std::to_string(setting.id);
+    for (const SettingKey& key : settingKeys()) {
+        if (key.id == setting.id) name = key.name;
+    }
+    std::ostringstream value;
+    std::visit(
+            [&value](const auto& v) {
+                using T = std::decay_t<decltype(v)>;
+                if constexpr (std::is_same_v<T, bool>) {
+                    value << (v ? "true" : "false");
+                } else if constexpr (std::is_same_v<T, Points>) {
+                    for (size_t i = 0; i < v.size(); i++)
+                        value << (i == 0 ? "" : ",") << v[i].x << ',' << v[i].y;
+                } else {
+                    value << v;
+                }
+            },
+            setting.value);
+    return name + "=" + value.str();
 }
 
 }  // namespace verolux::sim

@@ -35,4 +35,10 @@ Result<std::vector<host::SettingValue>> parseSettingsJson(std::string_view text,
                                                           std::string_view source);
 Result<std::vector<host::SettingValue>> readSettingsFile(const std::string& path);
 
+// The logLevel these settings leave the library at (0 when they do not set it).
+int32_t logLevelOf(const std::vector<host::SettingValue>& settings);
+
+// "key=value" as --set takes it, for the record of a run's options.
+std::string describeSetting(const host::SettingValue& setting);
+
 }  // namespace verolux::sim

@@ -1,50 +1,63 @@
 #pragma once
 
-#include <cstddef>
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <vector>
 
-#include "sim/Recording.h"
+#include "sim/Measures.h"
 
 namespace verolux::sim {
 
-// The numbers verolux-sim prints after a run. Values that a recording cannot give (a rate without
-// a run length, a latency without a displayed frame) are empty and print as "n/a".
-struct Summary {
+// What the run knew of a layer besides its records.
+struct LayerFacts {
+    std::string role;  // "run" or "reference"
     uint32_t mode = 0;
-    std::optional<double> runSec;  // endTime - startTime
-    size_t queuedFrames = 0;       // frames with a queue time
-    size_t refreshes = 0;
-    std::optional<double> gameFps;       // queued frames per second of run
-    std::optional<double> displayedFps;  // refreshes showing a picture unlike the last, per second
-    // Shares of all refreshes, 0 to 1, by composition kind; "no state" is any other kind (0: the
-    // library announced none), so the four add up to 1.
-    double blendShare = 0;
-    double repeatShare = 0;
-    double newShare = 0;
-    double noStateShare = 0;
-    // The first and last delays announced; without announcements, those the refreshes carried.
-    std::optional<double> startDelayMs;
-    std::optional<double> endDelayMs;
-    size_t delayChanges = 0;
-    // From queue to the first refresh that showed the frame, over frames that were shown;
-    // nearest-rank percentiles.
-    size_t displayedFrames = 0;
-    std::optional<double> latencyP50Ms;
-    std::optional<double> latencyP99Ms;
-    // Content-time steps between adjacent refreshes that both showed something: their mean and
-    // their standard deviation (over n), the judder.
-    std::optional<double> meanStepMs;
-    std::optional<double> judderMs;
-    // Library CPU time per refresh, over all refreshes; p99 nearest-rank.
-    std::optional<double> cpuMeanUs;
-    std::optional<double> cpuP99Us;
+    double runSec = 0;
+    uint32_t buffers = 0;
+    bool buffersFixed = false;     // by --slots or queueSize rather than sized for the delay
+    uint64_t bufferBytes = 0;      // all the layer's buffers at the game's resolution
+    std::string resolution;        // "1920x1080"
+    std::optional<double> ownFps;  // the rate the game runs at on its own
+    double refreshHz = 0;          // the display's true refresh rate
+    nsecs_t startTime = 0;         // stutter times count from here
+    bool captureEnded = false;     // the run stopped because its capture ran out
 };
 
-Summary summarize(const Recording& recording);
+struct Summary {
+    LayerFacts facts;
+    MeasuredLayer measured;
+};
 
-// One line per number, units stated; the reference run, when given, in a second column.
+// The game queued under this share of its own rate: it was held back.
+constexpr double THROTTLE_SHARE = 0.98;
+
+bool throttled(const Summary& summary);
+
+// One line of the summary table: a section title (no values) or a measure with the run's value
+// and the reference's.
+struct SummaryRow {
+    std::string label;
+    std::string run;
+    std::string reference;
+    bool section = false;
+};
+
+std::vector<SummaryRow> summaryRows(const Summary& run, const Summary* reference);
+
+// Plain sentences above the table: whether interpolation made the motion smoother and what it
+// cost, then warnings about the run itself (a held-back game, skipped vsyncs).
+std::vector<std::string> findings(const Summary& run, const Summary* reference);
+
+// The name of an interpolation mode: "retime" for 0, ... "latency reduction" for 5.
+const char* modeName(uint32_t mode);
+
+// The watchdog warnings of both layers in time order, one line each ("none" when there were none),
+// as the settings client read them back.
+std::vector<std::string> ledgerLines(const Summary& run, const Summary* reference);
+
+// The findings, a blank line, the table with the reference in a second column, and the ledger of
+// watchdog warnings.
 std::string formatSummary(const Summary& run, const Summary* reference = nullptr);
 
 }  // namespace verolux::sim

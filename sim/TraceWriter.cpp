@@ -2,259 +2,232 @@
 
 #include <json/writer.h>
 
-#include <algorithm>
-#include <cerrno>
-#include <cstring>
-#include <fstream>
-#include <memory>
+#include <cinttypes>
+#include <cstdarg>
+#include <cstdio>
 
-#include "EventDispatcher.h"
+#include "sim/WarningLedger.h"
 
 namespace verolux::sim {
 
-using namespace android::Interpolation;
-
 namespace {
 
-constexpr int RUN_PID = 1;
-constexpr int REFERENCE_PID = 2;
 constexpr int DISPLAY_TID = 1;
-constexpr int COMPOSITION_TID = 2;
+constexpr int GAME_TID = 2;
 constexpr int UNKNOWN_SLOT_TID = 9;
 constexpr int FIRST_SLOT_TID = 10;
+constexpr nsecs_t SECOND = 1'000'000'000;
 
-// Appends the events of one recording to the trace's event array.
-class ProcessTrace {
+std::string compactJson(const Json::Value& value) {
+    Json::StreamWriterBuilder builder;
+    builder["indentation"] = "";
+    return Json::writeString(builder, value);
+}
+
+// Events counted per second of the run, reported when the second is over.
+class PerSecond {
 public:
-    ProcessTrace(const Recording& recording, int pid, Json::Value& events)
-        : mRecording(recording), mPid(pid), mOrigin(timeOrigin(recording)), mEvents(events) {}
-
-    void write(const std::string& title);
+    // Returns the seconds that ended before `time`, with their counts, through `report`.
+    template <typename Report>
+    void add(nsecs_t time, nsecs_t origin, Report report) {
+        const nsecs_t second = (time - origin) / SECOND;
+        if (mSecond < 0) mSecond = second;
+        for (; mSecond < second; mSecond++) {
+            report(origin + (mSecond + 1) * SECOND, mCount);
+            mCount = 0;
+        }
+        mCount++;
+    }
 
 private:
-    // Times passed here are >= 0, as is the origin, so the difference cannot overflow.
-    double us(nsecs_t time) const { return (time - mOrigin) / 1e3; }
-    Json::Value& event(const char* ph, const std::string& name, const char* cat, int tid,
-                       nsecs_t time);
-    void metadata(const char* name, int tid, const Json::Value& args);
-    void nameThread(int tid, const std::string& name, int sortIndex);
-    void writeRefreshes();
-    void writeFrame(const FrameRecord& frame);
-    void writeDelays();
-    nsecs_t endTime() const;
-
-    const Recording& mRecording;
-    const int mPid;
-    const nsecs_t mOrigin;
-    Json::Value& mEvents;
+    nsecs_t mSecond = -1;
+    uint64_t mCount = 0;
 };
-
-Json::Value& ProcessTrace::event(const char* ph, const std::string& name, const char* cat, int tid,
-                                 nsecs_t time) {
-    Json::Value e(Json::objectValue);
-    e["ph"] = ph;
-    e["name"] = name;
-    e["cat"] = cat;
-    e["pid"] = mPid;
-    e["tid"] = tid;
-    e["ts"] = us(time);
-    return mEvents.append(std::move(e));
-}
-
-void ProcessTrace::metadata(const char* name, int tid, const Json::Value& args) {
-    Json::Value e(Json::objectValue);
-    e["ph"] = "M";
-    e["name"] = name;
-    e["pid"] = mPid;
-    e["tid"] = tid;
-    e["args"] = args;
-    mEvents.append(std::move(e));
-}
-
-void ProcessTrace::nameThread(int tid, const std::string& name, int sortIndex) {
-    Json::Value args(Json::objectValue);
-    args["name"] = name;
-    metadata("thread_name", tid, args);
-    Json::Value sort(Json::objectValue);
-    sort["sort_index"] = sortIndex;
-    metadata("thread_sort_index", tid, sort);
-}
-
-nsecs_t ProcessTrace::endTime() const {
-    if (mRecording.endTime >= 0) return mRecording.endTime;
-    nsecs_t end = mOrigin;
-    for (const RefreshRecord& refresh : mRecording.refreshes)
-        end = std::max(end, refresh.vsyncTime);
-    return end;
-}
-
-std::string stateName(const RefreshRecord& refresh) {
-    std::string frames;
-    for (const ComposedItem& item : refresh.items) {
-        if (!frames.empty()) frames += '+';
-        frames += std::to_string(item.frameNumber);
-    }
-    switch (refresh.kind) {
-        case eBlendedCompositionEvent:
-            return "blend " + frames;
-        case eRepeatedCompositionEvent:
-            return "repeat " + frames;
-        case eNewFrameCompositionEvent:
-            return "new " + frames;
-        default:
-            return frames.empty() ? "no state" : "state " + frames;
-    }
-}
-
-void ProcessTrace::writeRefreshes() {
-    const auto& refreshes = mRecording.refreshes;
-    for (size_t i = 0; i < refreshes.size(); i++) {
-        const RefreshRecord& refresh = refreshes[i];
-        if (refresh.vsyncTime < 0) continue;
-        Json::Value& vsync = event("i", "vsync", "display", DISPLAY_TID, refresh.vsyncTime);
-        vsync["s"] = "t";
-        vsync["args"]["index"] = Json::UInt64(refresh.index);
-
-        // Until the next vsync; the last refresh lasts one period.
-        double durationUs = mRecording.refreshPeriod / 1e3;
-        if (i + 1 < refreshes.size() && refreshes[i + 1].vsyncTime >= 0) {
-            durationUs = us(refreshes[i + 1].vsyncTime) - us(refresh.vsyncTime);
-        }
-        Json::Value& state =
-                event("X", stateName(refresh), "composition", COMPOSITION_TID, refresh.vsyncTime);
-        state["dur"] = std::max(0.0, durationUs);
-        Json::Value& args = state["args"];
-        args["index"] = Json::UInt64(refresh.index);
-        args["kind"] = refresh.kind;
-        args["frames"] = Json::Value(Json::arrayValue);
-        args["alphas"] = Json::Value(Json::arrayValue);
-        args["weights"] = Json::Value(Json::arrayValue);
-        for (const ComposedItem& item : refresh.items) {
-            args["frames"].append(Json::UInt64(item.frameNumber));
-            args["alphas"].append(item.alpha);
-            args["weights"].append(item.weight);
-        }
-        if (refresh.contentTime >= 0) args["content_ms"] = (refresh.contentTime - mOrigin) / 1e6;
-        if (refresh.displayTime >= 0)
-            args["display_time_ms"] = (refresh.displayTime - mOrigin) / 1e6;
-    }
-}
-
-void ProcessTrace::writeFrame(const FrameRecord& frame) {
-    if (frame.queueTime < 0) return;
-    const std::string name = "frame " + std::to_string(frame.number);
-    const bool released = frame.releaseTime >= 0;
-    const nsecs_t end = std::max(frame.queueTime, released ? frame.releaseTime : endTime());
-    const bool slotted = frame.slot >= 0;
-    const int tid = slotted ? FIRST_SLOT_TID + frame.slot : UNKNOWN_SLOT_TID;
-
-    Json::Value args(Json::objectValue);
-    args["frame"] = Json::UInt64(frame.number);
-    args["slot"] = frame.slot;
-    args["released"] = released;
-    if (frame.renderDoneTime >= 0)
-        args["render_ms"] = (frame.renderDoneTime - frame.queueTime) / 1e6;
-    if (frame.firstDisplayTime >= 0) {
-        args["latency_ms"] = (frame.firstDisplayTime - frame.queueTime) / 1e6;
-    }
-
-    const Json::UInt64 id = frame.number;
-    if (slotted) {
-        Json::Value& slice = event("X", name, "frame", tid, frame.queueTime);
-        slice["dur"] = us(end) - us(frame.queueTime);
-        slice["args"] = args;
-    } else {
-        Json::Value& begin = event("b", name, "frame", tid, frame.queueTime);
-        begin["id"] = id;
-        begin["args"] = args;
-        event("e", name, "frame", tid, end)["id"] = id;
-    }
-    const std::pair<const char*, nsecs_t> steps[] = {{"render done", frame.renderDoneTime},
-                                                     {"acquire", frame.acquireTime},
-                                                     {"first display", frame.firstDisplayTime}};
-    for (const auto& [stepName, time] : steps) {
-        if (time < 0) continue;
-        Json::Value& step = event(slotted ? "i" : "n", stepName, "frame", tid, time);
-        if (slotted) {
-            step["s"] = "t";
-        } else {
-            step["id"] = id;
-        }
-        step["args"]["frame"] = Json::UInt64(frame.number);
-    }
-}
-
-void ProcessTrace::writeDelays() {
-    for (const DelayChange& change : mRecording.delayChanges) {
-        if (change.time < 0) continue;
-        event("C", "display delay", "delay", DISPLAY_TID, change.time)["args"]["ms"] =
-                change.delay / 1e6;
-    }
-}
-
-void ProcessTrace::write(const std::string& title) {
-    Json::Value name(Json::objectValue);
-    name["name"] = title;
-    metadata("process_name", 0, name);
-    Json::Value sort(Json::objectValue);
-    sort["sort_index"] = mPid;
-    metadata("process_sort_index", 0, sort);
-
-    nameThread(DISPLAY_TID, "display", 0);
-    nameThread(COMPOSITION_TID, "composition", 1);
-    std::vector<int> slots;
-    for (const FrameRecord& frame : mRecording.frames) {
-        if (frame.queueTime >= 0) slots.push_back(frame.slot);
-    }
-    std::sort(slots.begin(), slots.end());
-    slots.erase(std::unique(slots.begin(), slots.end()), slots.end());
-    for (int slot : slots) {
-        if (slot >= 0) {
-            nameThread(FIRST_SLOT_TID + slot, "slot " + std::to_string(slot), 2 + slot);
-        } else {
-            nameThread(UNKNOWN_SLOT_TID, "frames without a slot", 2);
-        }
-    }
-
-    writeRefreshes();
-    for (const FrameRecord& frame : mRecording.frames)
-        writeFrame(frame);
-    writeDelays();
-}
-
-std::string title(const char* role, const Recording& recording) {
-    std::string text = std::string(role) + ": mode " + std::to_string(recording.mode);
-    if (!recording.layerName.empty()) text += " " + recording.layerName;
-    return text;
-}
 
 }  // namespace
 
-Json::Value buildTrace(const Recording& run, const Recording* reference) {
-    Json::Value trace(Json::objectValue);
-    Json::Value& events = trace["traceEvents"] = Json::Value(Json::arrayValue);
-    ProcessTrace(run, RUN_PID, events).write(title("run", run));
-    if (reference != nullptr) {
-        ProcessTrace(*reference, REFERENCE_PID, events).write(title("reference", *reference));
+class TraceWriter::LayerTrace final : public RecordSink {
+public:
+    LayerTrace(TraceWriter& writer, int pid, nsecs_t refreshPeriod)
+        : mWriter(writer), mPid(pid), mRefreshPeriod(refreshPeriod) {}
+
+    void onFrame(const FrameRecord& frame) override;
+    void onRefresh(const RefreshRecord& refresh) override;
+    void onDelayChange(nsecs_t time, nsecs_t delay) override {
+        counter("display delay", time, "ms", static_cast<double>(delay) / 1e6);
     }
-    trace["displayTimeUnit"] = "ms";
-    return trace;
+
+    void emit(const char* format, ...) __attribute__((format(printf, 2, 3)));
+    double us(nsecs_t time) const { return static_cast<double>(time - mWriter.mOrigin) / 1e3; }
+    void counter(const char* name, nsecs_t time, const char* unit, double value) {
+        emit("{\"ph\":\"C\",\"name\":\"%s\",\"pid\":%d,\"ts\":%.3f,\"args\":{\"%s\":%.3f}}", name,
+             mPid, us(time), unit, value);
+    }
+    void nameThread(int tid, const std::string& name) {
+        emit("{\"ph\":\"M\",\"name\":\"thread_name\",\"pid\":%d,\"tid\":%d,\"args\":{\"name\":%s}}",
+             mPid, tid, compactJson(name).c_str());
+        emit("{\"ph\":\"M\",\"name\":\"thread_sort_index\",\"pid\":%d,\"tid\":%d,\"args\":{"
+             "\"sort_index\":%d}}",
+             mPid, tid, tid);
+    }
+
+    TraceWriter& mWriter;
+    const int mPid;
+    const nsecs_t mRefreshPeriod;
+    uint64_t mNamedSlots = 0;  // bit per slot below 64 already named
+    void onWarning(const WarningRecord& warning) override;
+
+    PerSecond mGameFps;
+    PerSecond mDisplayedFps;
+    PerSecond mRenderRate;
+    int32_t mRefreshRate = -1;    // last written
+    int32_t mGameRateLimit = -1;  // last written; 0 when not applied
+};
+
+void TraceWriter::LayerTrace::emit(const char* format, ...) {
+    char text[768];
+    va_list args;
+    va_start(args, format);
+    vsnprintf(text, sizeof(text), format, args);
+    va_end(args);
+    std::ostream& out = mWriter.mOut;
+    out << ",\n" << text;
 }
 
-Status writeTraceFile(const std::string& path, const Recording& run, const Recording* reference) {
-    std::ofstream out(path, std::ios::binary | std::ios::trunc);
-    if (!out) return {errorLine("cannot write " + path + ": " + strerror(errno))};
-    Json::StreamWriterBuilder builder;
-    builder["indentation"] = "";
-    // Microseconds to the nanosecond.
-    builder["precision"] = 3;
-    builder["precisionType"] = "decimal";
-    const std::unique_ptr<Json::StreamWriter> writer(builder.newStreamWriter());
-    writer->write(buildTrace(run, reference), &out);
-    out << '\n';
-    out.close();
-    if (!out) return {errorLine("cannot write " + path)};
-    return {};
+void TraceWriter::LayerTrace::onRefresh(const RefreshRecord& refresh) {
+    std::string frames, alphas, weights;
+    for (uint8_t i = 0; i < refresh.itemCount; i++) {
+        const char* comma = i == 0 ? "" : ",";
+        char item[96];
+        snprintf(item, sizeof(item), "%s%" PRIu64, comma, refresh.items[i].frameNumber);
+        frames += item;
+        snprintf(item, sizeof(item), "%s%.4g", comma, refresh.items[i].alpha);
+        alphas += item;
+        snprintf(item, sizeof(item), "%s%.4g", comma, refresh.items[i].weight);
+        weights += item;
+    }
+    char content[48] = "null";
+    if (refresh.contentTime >= 0) {
+        snprintf(content, sizeof(content), "%.3f",
+                 (refresh.contentTime - static_cast<double>(mWriter.mOrigin)) / 1e6);
+    }
+    emit("{\"ph\":\"X\",\"name\":\"%s\",\"cat\":\"display\",\"pid\":%d,\"tid\":%d,\"ts\":%.3f,"
+         "\"dur\":%.3f,\"args\":{\"refresh\":%" PRIu64
+         ",\"frames\":[%s],\"alphas\":[%s],\"weights\":[%s],\"content_ms\":%s}}",
+         pictureName(refresh.picture), mPid, DISPLAY_TID, us(refresh.presentTime),
+         static_cast<double>(mRefreshPeriod) / 1e3, refresh.index, frames.c_str(), alphas.c_str(),
+         weights.c_str(), content);
+    counter("queue length", refresh.vsyncTime, "frames", refresh.queueLength);
+    if (refresh.contentTime >= 0) {
+        counter("content age", refresh.presentTime, "ms",
+                (static_cast<double>(refresh.presentTime) - refresh.contentTime) / 1e6);
+    }
+    if (refresh.refreshRate != mRefreshRate) {
+        mRefreshRate = refresh.refreshRate;
+        counter("detected refresh rate", refresh.vsyncTime, "Hz", mRefreshRate);
+    }
+    const int32_t limit = refresh.gameRateLimitApplied ? refresh.gameRateLimit : 0;
+    if (limit != mGameRateLimit) {
+        mGameRateLimit = limit;
+        counter("game-rate limit", refresh.vsyncTime, "fps", limit);
+    }
+    if (refresh.refused) {
+        emit("{\"ph\":\"i\",\"s\":\"t\",\"name\":\"refused presentation\",\"cat\":\"display\","
+             "\"pid\":%d,\"tid\":%d,\"ts\":%.3f,\"args\":{\"refresh\":%" PRIu64 "}}",
+             mPid, DISPLAY_TID, us(refresh.vsyncTime), refresh.index);
+    } else {
+        mRenderRate.add(refresh.vsyncTime, mWriter.mOrigin, [this](nsecs_t end, uint64_t n) {
+            counter("render rate", end, "fps", static_cast<double>(n));
+        });
+    }
+    if (refresh.picture == Picture::BLEND || refresh.picture == Picture::NEW) {
+        mDisplayedFps.add(refresh.presentTime, mWriter.mOrigin, [this](nsecs_t end, uint64_t n) {
+            counter("displayed fps", end, "fps", static_cast<double>(n));
+        });
+    }
+}
+
+void TraceWriter::LayerTrace::onWarning(const WarningRecord& warning) {
+    emit("{\"ph\":\"i\",\"s\":\"p\",\"name\":\"watchdog warning\",\"cat\":\"watchdog\","
+         "\"pid\":%d,\"tid\":%d,\"ts\":%.3f,\"args\":{\"code\":\"%s\",\"value\":%g}}",
+         mPid, DISPLAY_TID, us(warning.time), warningCodeName(warning.code).c_str(), warning.value);
+}
+
+void TraceWriter::LayerTrace::onFrame(const FrameRecord& frame) {
+    if (frame.startTime >= 0 && frame.dequeueTime > frame.startTime) {
+        emit("{\"ph\":\"X\",\"name\":\"wait for buffer\",\"cat\":\"game\",\"pid\":%d,\"tid\":%d,"
+             "\"ts\":%.3f,\"dur\":%.3f,\"args\":{\"frame\":%" PRIu64 "}}",
+             mPid, GAME_TID, us(frame.startTime), us(frame.dequeueTime) - us(frame.startTime),
+             frame.number);
+    }
+    if (frame.queueTime < 0) return;
+    if (frame.dequeueTime >= 0) {
+        emit("{\"ph\":\"X\",\"name\":\"draw\",\"cat\":\"game\",\"pid\":%d,\"tid\":%d,\"ts\":%.3f,"
+             "\"dur\":%.3f,\"args\":{\"frame\":%" PRIu64 "}}",
+             mPid, GAME_TID, us(frame.dequeueTime), us(frame.queueTime) - us(frame.dequeueTime),
+             frame.number);
+    }
+    const bool known = frame.slot >= 0 && frame.slot < 64;
+    const int tid = known ? FIRST_SLOT_TID + frame.slot : UNKNOWN_SLOT_TID;
+    if (!(known ? (mNamedSlots >> frame.slot) & 1 : (mNamedSlots >> 63) & 1)) {
+        nameThread(tid, known ? "slot " + std::to_string(frame.slot) : "slot unknown");
+        mNamedSlots |= uint64_t{1} << (known ? frame.slot : 63);
+    }
+    const nsecs_t end = frame.releaseTime >= frame.queueTime ? frame.releaseTime : frame.queueTime;
+    char latency[32] = "null";
+    if (!frame.dropped()) {
+        snprintf(latency, sizeof(latency), "%.3f",
+                 static_cast<double>(frame.firstPresentTime - frame.queueTime) / 1e6);
+    }
+    emit("{\"ph\":\"X\",\"name\":\"frame %" PRIu64
+         "\",\"cat\":\"frame\",\"pid\":%d,\"tid\":%d,"
+         "\"ts\":%.3f,\"dur\":%.3f,\"args\":{\"frame\":%" PRIu64
+         ",\"dropped\":%s,\"latency_ms\":%s}}",
+         frame.number, mPid, tid, us(frame.queueTime), us(end) - us(frame.queueTime), frame.number,
+         frame.dropped() ? "true" : "false", latency);
+    const std::pair<const char*, nsecs_t> steps[] = {{"render done", frame.renderDoneTime},
+                                                     {"acquire", frame.acquireTime},
+                                                     {"first present", frame.firstPresentTime}};
+    for (const auto& [name, time] : steps) {
+        if (time < 0) continue;
+        emit("{\"ph\":\"i\",\"s\":\"t\",\"name\":\"%s\",\"cat\":\"frame\",\"pid\":%d,\"tid\":%d,"
+             "\"ts\":%.3f,\"args\":{\"frame\":%" PRIu64 "}}",
+             name, mPid, tid, us(time), frame.number);
+    }
+    mGameFps.add(frame.queueTime, mWriter.mOrigin, [this](nsecs_t end, uint64_t n) {
+        counter("game fps", end, "fps", static_cast<double>(n));
+    });
+}
+
+TraceWriter::TraceWriter(std::ostream& out, nsecs_t origin, const Json::Value& options)
+    : mOut(out), mOrigin(origin) {
+    mOut << "{\"displayTimeUnit\":\"ms\",\"metadata\":" << compactJson(options)
+         << ",\"traceEvents\":[\n"
+         << R"({"ph":"M","name":"process_name","pid":0,"args":{"name":"verolux-sim"}})";
+}
+
+TraceWriter::~TraceWriter() {
+    finish();
+}
+
+RecordSink& TraceWriter::addLayer(int pid, const std::string& title, nsecs_t refreshPeriod) {
+    auto& layer = mLayers.emplace_back(std::make_unique<LayerTrace>(*this, pid, refreshPeriod));
+    layer->emit("{\"ph\":\"M\",\"name\":\"process_name\",\"pid\":%d,\"args\":{\"name\":%s}}", pid,
+                compactJson(title).c_str());
+    layer->emit(
+            "{\"ph\":\"M\",\"name\":\"process_sort_index\",\"pid\":%d,\"args\":{"
+            "\"sort_index\":%d}}",
+            pid, pid);
+    layer->nameThread(DISPLAY_TID, "display");
+    layer->nameThread(GAME_TID, "game");
+    return *layer;
+}
+
+void TraceWriter::finish() {
+    if (mFinished) return;
+    mFinished = true;
+    mOut << "\n]}\n";
+    mOut.flush();
 }
 
 }  // namespace verolux::sim

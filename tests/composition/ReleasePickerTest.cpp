@@ -5,6 +5,7 @@
 #include <functional>
 #include <future>
 #include <limits>
+#include <set>
 #include <thread>
 
 #include "FillInReleasePicker.h"
@@ -52,6 +53,31 @@ protected:
 
     void broadcast(EventType type, const EventData& data) {
         EventDispatcher::broadcastEvent(mUid, type, systemTime(SYSTEM_TIME_MONOTONIC), data);
+    }
+
+    static int policySteps(const LogCapture& log) {
+        int steps = 0;
+        for (const std::string& text : log.texts())
+            steps += text.find("tryRelease: size") != std::string::npos;
+        return steps;
+    }
+
+    // A selection on another thread, once its first policy step is made: a step holds the picker's
+    // mutex, so whatever takes the mutex afterwards comes after the selection has begun to wait.
+    static std::future<FrameItem> selectAfterOneStep(ReleasePicker* picker, const LogCapture& log) {
+        auto selection = std::async(std::launch::async,
+                                    [picker] { return picker->selectFrameForRelease(); });
+        while (policySteps(log) == 0)
+            std::this_thread::yield();
+        return selection;
+    }
+
+    static void setMargin(const sp<ReleasePicker>& picker, int32_t marginMs) {
+        if (auto* justInTime = dynamic_cast<JustInTimeReleasePicker*>(picker.get())) {
+            Settings settings;
+            settings.justInTimeMarginMs = static_cast<uint32_t>(marginMs);
+            justInTime->onSettingsChanged(settings);
+        }
     }
 
     const uint32_t mUid = test::nextTestUid();
@@ -130,6 +156,77 @@ TEST_F(ReleasePickerTest, logsEachPolicyStepAndEveryEventIssue) {
                             "Interpolation::NoInterpReleasePicker: [game#0] tryRelease: size 1 "
                             "upcomingDisplayTime 0 mLatestFrameDisplayedTime 5 "
                             "mUpcomingCompositionTime 500"));
+}
+
+// The selection carries out what decideRelease() decides without blocking.
+TEST_F(ReleasePickerTest, selectionCarriesOutWhatTheNonBlockingStepDecides) {
+    test::addSteadyFrames(*mTimings, 1, 30, 1 * MS, 2 * MS);  // the latency picker predicts 16 ms
+    std::set<int32_t> actions;
+    for (uint32_t mode = 0; mode <= eLatencyReductionMode; mode++) {
+        mList->clearEveryFrame();
+        sp<ReleasePicker> stepper = picker(mode), selector = picker(mode);
+        for (const sp<ReleasePicker>& each : {stepper, selector})
+            setMargin(each, 4);
+        // Frames; a composition 20 ms ahead, the middle frame on screen; the newest on screen.
+        for (int step = 0; step < 3; step++) {
+            if (step == 0) queue({10, 20, 30});
+            if (step == 1)
+                broadcast(eCompositionEstimateEvent, systemTime(SYSTEM_TIME_MONOTONIC) + 20 * MS);
+            if (step == 2) queue({-20, -10, 40});
+            if (step > 0) broadcast(eBufferComposedEvent, stateOf({step == 1 ? 20 : 40}));
+            const auto start = steady_clock::now();
+            const ReleaseChoice choice = stepper->decideRelease();
+            const FrameItem selected = selector->selectFrameForRelease();
+            const auto took = steady_clock::now() - start;
+            SCOPED_TRACE(testing::Message() << "mode " << mode << " action " << choice.action);
+            actions.insert(choice.action);
+            if (choice.action == ReleaseChoice::RELEASE) {
+                EXPECT_EQ(choice.frame.mID, selected.mID);
+            } else if (choice.action == ReleaseChoice::WAIT_FOR_EVENT) {
+                EXPECT_TRUE(selected.isEmpty());
+                EXPECT_GE(took, std::chrono::nanoseconds(ReleasePicker::EVENT_WAIT_TIMEOUT));
+            } else {  // a time to wait or to sleep, then the oldest frame
+                EXPECT_EQ(stepper->chooseOldestFrame().frame.mID, selected.mID);
+                EXPECT_GE(took, std::chrono::nanoseconds(choice.waitTime) - 1us);
+            }
+        }
+    }
+    EXPECT_EQ(4u, actions.size());
+}
+
+TEST_F(ReleasePickerTest, stopEndsASelectionInAnyWaitWhateverTheMargin) {
+    test::addSteadyFrames(*mTimings, 1, 30, 1 * MS, 2 * MS);
+    queue({10, 20, 30});
+    for (uint32_t mode = 0; mode <= eLatencyReductionMode; mode++) {
+        // The latency picker sleeps 16 ms with the newest frame on screen, and its release stands;
+        // the just-in-time one waits as long as its margin says, the others for an event: those
+        // waits end at once, with nothing released.
+        sp<ReleasePicker> waiting = picker(mode);
+        setMargin(waiting, std::numeric_limits<int32_t>::min());
+        broadcast(eBufferComposedEvent,
+                  mode == eLatencyReductionMode ? stateOf({30}) : RenderState{});
+        broadcast(eCompositionEstimateEvent, systemTime(SYSTEM_TIME_MONOTONIC) + 10'000 * MS);
+        LogCapture log(2);
+        auto selection = selectAfterOneStep(waiting.get(), log);
+        mode % 2 ? waiting.clear() : waiting->stop();  // the last reference stops it too
+        EXPECT_TRUE(waiting == nullptr || waiting->decideRelease().frame.isEmpty());
+        ASSERT_EQ(std::future_status::ready, selection.wait_for(1s)) << mode;
+        EXPECT_EQ(mode == eLatencyReductionMode ? 10 : 0, selection.get().mID) << mode;
+        EXPECT_FALSE(log.contains("Interpolation::ReleasePicker timed out. mContinue = 0"));
+    }
+}
+
+TEST_F(ReleasePickerTest, eventsThePolicyDoesNotReadNeverWakeTheSelection) {
+    queue({10});
+    for (uint32_t mode : {eRetimeMode, eFillInMode, eNoInterpMode, eUnlimitedMode}) {
+        sp<ReleasePicker> waiting = picker(mode);
+        LogCapture log(2);
+        auto selection = selectAfterOneStep(waiting.get(), log);
+        if (mode <= eFillInMode) broadcast(eBufferComposedEvent, stateOf({5}));  // read by neither
+        broadcast(eCompositionEstimateEvent, nsecs_t{1});
+        EXPECT_TRUE(selection.get().isEmpty());
+        EXPECT_EQ(1, policySteps(log)) << mode;
+    }
 }
 
 // A policy scripted by the test, to drive the waits of the selection.
@@ -222,30 +319,9 @@ TEST_F(ReleasePickerWaitTest, timedWaitEndsAtItsDeadline) {
     EXPECT_LT(elapsed, 200ms);
 }
 
-TEST_F(ReleasePickerWaitTest, tearDownReleasesAWaiterWithTheEmptyFrame) {
-    // The farthest deadline there is: only the tear-down can end this wait.
-    sp<ScriptedPicker> picker = script([](ScriptedPicker&, int) {
-        return ReleaseChoice{ReleaseChoice::WAIT_FOR_TIME, FrameItem(),
-                             std::numeric_limits<nsecs_t>::max()};
-    });
-    auto selection = selectAsync(picker.get());
-    EXPECT_EQ(std::future_status::timeout, selection.wait_for(10ms));
-
-    const auto start = steady_clock::now();
-    picker.clear();  // the last reference: stops, and waits for the selection to leave
-    EXPECT_LT(steady_clock::now() - start, 100ms);
-    // The selection has left the picker; its result reaches the future a moment later.
-    ASSERT_EQ(std::future_status::ready, selection.wait_for(100ms));
-    EXPECT_TRUE(selection.get().isEmpty());
-}
-
 class JustInTimeReleasePickerTest : public ReleasePickerTest {
 protected:
-    void setMargin(int32_t marginMs) {
-        Settings settings;
-        settings.justInTimeMarginMs = static_cast<uint32_t>(marginMs);
-        mPicker->onSettingsChanged(settings);
-    }
+    void setMargin(int32_t marginMs) { ReleasePickerTest::setMargin(mPicker, marginMs); }
 
     void composeAt(nsecs_t compositionTime, std::initializer_list<nsecs_t> shown) {
         mPicker->onEvent(eBufferComposedEvent, 0, stateOf(shown));
@@ -290,17 +366,15 @@ TEST_F(JustInTimeReleasePickerTest, otherwiseWaitsUntilTheMarginBeforeTheComposi
     const ReleaseChoice late = mPicker->attempEarlyRelease();
     EXPECT_EQ(ReleaseChoice::WAIT_FOR_TIME, late.action);
     EXPECT_EQ(1 * MS, late.waitTime);
-}
 
-TEST_F(JustInTimeReleasePickerTest, selectionWakesAtTheMarginBeforeTheComposition) {
-    setMargin(5);
-    queue({10, 20, 30});
-    const auto start = steady_clock::now();
-    composeAt(systemTime(SYSTEM_TIME_MONOTONIC) + 20 * MS, {20});
-    EXPECT_EQ(10, mPicker->selectFrameForRelease().mID);
-    const auto waited = steady_clock::now() - start;
-    EXPECT_GE(waited, 15ms);
-    EXPECT_LT(waited, 60ms);
+    // 25 days after the composition, as the policy asks, bounded to 50 ms after it.
+    setMargin(std::numeric_limits<int32_t>::min());
+    composeAt(clock.now() + 10 * MS, {20});
+    EXPECT_EQ(2'147'483'658 * MS, mPicker->attempEarlyRelease().waitTime);
+    LogCapture log(1);
+    EXPECT_EQ(60 * MS, mPicker->decideRelease().waitTime);
+    EXPECT_THAT(log.texts(), ElementsAre("Interpolation::ReleasePicker [game#0] wait of "
+                                         "2147483658000000 ns bounded to 60000000 ns"));
 }
 
 class MLLatencyReductionReleasePickerTest : public ReleasePickerTest {

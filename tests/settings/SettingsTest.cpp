@@ -208,17 +208,32 @@ TEST_F(SettingsControllerTest, truncatedParcelReadsAsZerosInTimeBoundedByItsSize
     EXPECT_EQ(eRetimeMode, stored(mUid).mode);
     EXPECT_EQ(2, stored(mUid).rfpsOffset);
 
-    // Missing pairs read as (0, 0), corrected here to (0, 5); one stands for all its repeats.
+    // Missing pairs read as (0, 0), each logged and judged by the curve, as many as the parcel
+    // has words (5 here, so three pairs); one more stands for the rest. Here each is corrected to
+    // (0, 5).
     log.clear();
     ASSERT_TRUE(update(mUid, {1, 21, INT32_MAX, -1.0f, 5.0f}));
     EXPECT_THAT(stored(mUid).alphaFunction.getPoints(),
-                ElementsAre(Point{0, 0}, Point{-1, 5}, Point{0, 5}));
+                ElementsAre(Point{0, 0}, Point{-1, 5}, Point{0, 5}, Point{0, 5}, Point{0, 5},
+                            Point{0, 5}));
     EXPECT_TRUE(
             log.contains("Interpolation: alpha function of 2147483647 points ends after 1 in "
                          "the parcel; reading the missing ones as one (0.000000, 0.000000)"));
+    EXPECT_EQ(4, log.count("Line point: (0.000000, 0.000000)"));
+    // Three points claimed and one and a half sent: the reads give exactly (0.7, 0) and (0, 0).
+    log.clear();
     ASSERT_TRUE(update(mUid, {2, 21, 3, 0.5f, 0.5f, 0.7f}));
     EXPECT_THAT(stored(mUid).alphaFunction.getPoints(),
                 ElementsAre(Point{0, 0}, Point{0.5f, 0.5f}, Point{0.7f, 0.5f}, Point{1, 1}));
+    EXPECT_THAT(log.texts(),
+                ElementsAre("Reading 3 line points for alpha function",
+                            "Line point: (0.500000, 0.500000)", "Line point: (0.700000, 0.000000)",
+                            "Line point: (0.000000, 0.000000)",
+                            "Warning: correction applied to non-increasing sequence of Y values "
+                            "used in alpha function settings! (0.700000, 0.000000) -> (0.700000, "
+                            "0.500000)",
+                            "Warning: alpha function point is out of order! Ignoring (0.000000, "
+                            "0.000000)"));
     for (int32_t count : {0, -5}) {
         ASSERT_TRUE(update(mUid, {2, 21, count, 0, 20}));
         EXPECT_THAT(stored(mUid).alphaFunction.getPoints(), ElementsAre(Point{0, 0}, Point{1, 1}));

@@ -43,7 +43,11 @@ TEST(CaptureTest, badInputNamesTheFileAndTheLine) {
             {header + "1,40,39\n", ":3: render_done_ns is earlier than queue_ns"},
             {header + "1,40,50\n2,39,50\n", ":4: queue_ns is earlier than the previous frame's"},
             {header + "1,40\n", ":3: expected 3 cells, found 2"},
-            {"frame,display_ns\n0,0\n", ":1: the header names no queue_ns column"},
+            {"frame,display_ns\n0,0\n",
+             ":1: the header names neither queue_ns nor PresentMon's MsBetweenPresents"},
+            {"TimeInSeconds,MsBetweenPresents\n1.5,x\n", ":2: MsBetweenPresents is not a number"},
+            {"TimeInSeconds,MsBetweenPresents\n1.5,1\n1.4,1\n",
+             ":3: TimeInSeconds is earlier than the previous frame's"},
             {"queue_ns,queue_ns\n0,0\n", ":1: column \"queue_ns\" appears twice"},
             {"queue_ns\n0\n" + std::string(5000, '1'), ":3: line is longer than 4096 characters"},
             {"queue_ns\n\n", ": no frames after the header"},
@@ -56,6 +60,27 @@ TEST(CaptureTest, badInputNamesTheFileAndTheLine) {
               parse("queue_ns\n0\n1\n2\n3\n", 3).error);
     EXPECT_EQ("verolux-sim: cannot read capture /nonexistent/c.csv: No such file or directory",
               readCapture("/nonexistent/c.csv").error);
+    // An endless line is refused after 4 KiB, not read whole.
+    EXPECT_EQ("verolux-sim: /dev/zero:1: line is longer than 4096 characters",
+              readCapture("/dev/zero").error);
+}
+
+TEST(CaptureTest, readsTheGamesOwnSwapChainFromAPresentMonFile) {
+    // The game presents three times, the overlay once; render times in ms, "NA" unknown.
+    const auto capture =
+            parse("Application,ProcessID,SwapChainAddress,Runtime,TimeInSeconds,MsBetweenPresents,"
+                  "MsUntilRenderComplete\n"
+                  "game.exe,10,0x1,DXGI,2.5,16.0,4.5\n"
+                  "overlay.exe,11,0x9,DXGI,2.505,16.0,1.0\n"
+                  "game.exe,10,0x1,DXGI,2.516,16.0,NA\n"
+                  "game.exe,10,0x1,DXGI,2.5331,17.1,2.0\n");
+    EXPECT_EQ("PresentMon", capture.value.format);
+    EXPECT_THAT(times(capture),
+                testing::ElementsAre(std::pair(0, 4'500'000), std::pair(16'000'000, -1),
+                                     std::pair(33'100'000, 35'100'000)));
+    // Without TimeInSeconds the presents add up from MsBetweenPresents.
+    EXPECT_THAT(times(parse("MsBetweenPresents\n10\n12.5\n")),
+                testing::ElementsAre(std::pair(0, -1), std::pair(12'500'000, -1)));
 }
 
 TEST(CaptureTest, theShippedCaptureIsValid) {
@@ -65,6 +90,9 @@ TEST(CaptureTest, theShippedCaptureIsValid) {
     ASSERT_EQ(300u, frames.size());
     EXPECT_GT(frames[61].queueTime - frames[60].queueTime, 80'000'000);  // a long frame: 83 ms
     EXPECT_EQ(-1, frames[100].renderDoneTime);
+    // The pace asked of a run that replayed the first 61 frames: 60 intervals of 33.3 ms.
+    EXPECT_NEAR(30.0, capture.value.fpsOverFirst(61), 0.2);
+    EXPECT_NEAR(1e9 / capture.value.meanInterval(), capture.value.fpsOverFirst(1000), 1e-9);
 }
 
 }  // namespace

@@ -62,8 +62,10 @@ TEST(OptionsTest, takesValuesNextOrAfterAnEqualsSignAndPutsTheSettingsFileBefore
 TEST(OptionsTest, refusesImpossibleOptionsAndSettingsWithOneLineEach) {
     const std::vector<std::pair<std::vector<const char*>, std::string>> cases = {
             {{"--hz", "0"}, "--hz must be between 1 and 1000 (got 0)"},
-            {{"--fps", "-5"}, "--fps must be greater than 0 and at most 1000 (got -5)"},
-            {{"--fps=1000.5"}, "--fps must be greater than 0 and at most 1000 (got 1000.5)"},
+            {{"--fps", "-5"}, "--fps must be between 0.1 and 1000 (got -5)"},
+            {{"--fps=1000.5"}, "--fps must be between 0.1 and 1000 (got 1000.5)"},
+            // A frame period beyond any run, which once overflowed into a game running flat out.
+            {{"--fps=1e-300"}, "--fps must be between 0.1 and 1000 (got 1e-300)"},
             {{"--duration", "0"},
              "--duration must be greater than 0 and at most 3600 seconds (got 0)"},
             {{"--jitter-ms", "-0.1"}, "--jitter-ms must be between 0 and 1000 (got -0.1)"},
@@ -79,7 +81,9 @@ TEST(OptionsTest, refusesImpossibleOptionsAndSettingsWithOneLineEach) {
             {{"--quiet=1"}, "--quiet takes no value"},
             {{"--fsp", "30"}, "unknown option \"--fsp\" (try --help)"},
             {{"30"}, "unexpected argument \"30\" (try --help)"},
-            {{"--set=gameFpsLimt=30"}, "--set: unknown settings key \"gameFpsLimt\""},
+            {{"--set=gameFpsLimt=30"},
+             "--set: unknown settings key \"gameFpsLimt\" (did you mean \"gameFpsLimit\"?)"},
+            {{"--set=frobnicate=1"}, "--set: unknown settings key \"frobnicate\""},
             {{"--set=delayMs"}, "--set expects key=value (got \"delayMs\")"},
             {{"--set=delayMs=1.5"}, "--set: delayMs expects a whole number (got \"1.5\")"},
             {{"--set=delayMs=4294967296"}, "--set: delayMs is out of range (got \"4294967296\")"},
@@ -102,7 +106,10 @@ TEST(OptionsTest, refusesImpossibleOptionsAndSettingsWithOneLineEach) {
 
 TEST(OptionsTest, badSettingsJsonNamesTheFileAndTheProblem) {
     const std::vector<std::pair<std::string, std::string>> cases = {
-            {R"({"fps": 30})", "unknown settings key \"fps\""},
+            {R"({"rfp": 30})", "unknown settings key \"rfp\" (did you mean \"rfps\"?)"},
+            // The JSON reader throws past its stack limit instead of reporting an error.
+            {std::string(1000, '[') + std::string(1000, ']'),
+             "invalid JSON: nested deeper than 16 levels"},
             {R"({"delayMs": "40"})", "delayMs expects a whole number (got \"40\")"},
             {R"({"smartDelay": 2})", "smartDelay expects true, false, 1 or 0 (got \"2\")"},
             {R"({"alphaFunction": [[0, 0, 1]]})",

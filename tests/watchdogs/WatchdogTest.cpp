@@ -81,9 +81,16 @@ protected:
     sp<RealWatchdogInterface> mInterface = new RealWatchdogInterface(mAggregator);
 };
 
+// The wall clock in ms as the controller reads it; time() reads a coarser clock that can lag it.
+int64_t wallClockMs() {
+    timespec now{};
+    clock_gettime(CLOCK_REALTIME, &now);
+    return int64_t{now.tv_sec} * 1000 + now.tv_nsec / 1'000'000;
+}
+
 TEST_F(WatchdogTest, warningsAreWrittenOnceOldestFirstAsTwentyByteRecords) {
     SettingsController::getInstance()->setSettings(mUid, limits(60, 0, -1));
-    const int64_t before = time(nullptr) * int64_t{1000};
+    const int64_t before = wallClockMs();
     WatchdogWarningController::addWarning(mUid, LOW_GAME_FPS, 42, true);
     WatchdogWarningController::addWarning(mUid, LATENCY_REDUCTION_UNSTABLE, 0.5f, true);
     WatchdogWarningController::addWarning(mUid, HIGH_GAME_FPS, 99, /*record=*/false);
@@ -97,7 +104,7 @@ TEST_F(WatchdogTest, warningsAreWrittenOnceOldestFirstAsTwentyByteRecords) {
     EXPECT_EQ(w, (std::vector<uint32_t>{20, 0, w[2], w[3], 42, 20, 1, w[7], w[8], bitsOf(0.5f), 20,
                                         7, w[12], w[13], 0}));
     const int64_t timestamp = w[2] | int64_t{w[3]} << 32;  // of the first, little-endian
-    EXPECT_TRUE(timestamp >= before && timestamp <= (time(nullptr) + 1) * int64_t{1000});
+    EXPECT_TRUE(timestamp >= before && timestamp <= wallClockMs());
     EXPECT_THAT(fetchWarnings(mUid), IsEmpty());
 
     for (int i = 0; i < 11; i++)

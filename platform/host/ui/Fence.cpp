@@ -7,11 +7,24 @@
 
 #include <cerrno>
 
+#ifdef VEROLUX_THREAD_SANITIZER
+extern "C" void __tsan_acquire(void* address);
+#endif
+
 namespace android {
 
 const sp<Fence> Fence::NO_FENCE = new Fence();
 
 Fence::Fence(base::unique_fd fenceFd) : mFenceFd(std::move(fenceFd)) {}
+
+Fence::~Fence() {
+#ifdef VEROLUX_THREAD_SANITIZER
+    // The last reference's acquire fence, which the thread sanitizer does not model, orders every
+    // other holder's use of the fence before this destructor. The count that the holders release
+    // is the reference base's only member, so its address is the base's.
+    __tsan_acquire(const_cast<LightRefBase<Fence>*>(static_cast<const LightRefBase<Fence>*>(this)));
+#endif
+}
 
 status_t Fence::wait(int timeout) const {
     if (!mFenceFd.ok()) return NO_ERROR;

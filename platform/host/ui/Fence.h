@@ -43,7 +43,7 @@ public:
 
 private:
     friend class LightRefBase<Fence>;
-    ~Fence() = default;
+    ~Fence();
 
     base::unique_fd mFenceFd;
     std::atomic<nsecs_t> mSignalTime{SIGNAL_TIME_PENDING};
