@@ -6,6 +6,7 @@
 #include <cstring>
 #include <fstream>
 #include <map>
+#include <sstream>
 
 #include "sim/TextNumbers.h"
 
@@ -246,7 +247,8 @@ std::string CaptureParser::finish(Capture& capture) {
 
 nsecs_t Capture::meanInterval() const {
     if (frames.size() < 2 || span() <= 0) return 1'000'000'000;
-    return span() / static_cast<nsecs_t>(frames.size() - 1);
+    // Frames closer than a nanosecond apart on average still give a finite rate.
+    return std::max<nsecs_t>(1, span() / static_cast<nsecs_t>(frames.size() - 1));
 }
 
 double Capture::fpsOverFirst(size_t count) const {
@@ -290,6 +292,11 @@ Result<Capture> parseCapture(std::istream& in, const std::string& name, size_t m
     R result;
     if (std::string error = parser.finish(result.value); !error.empty()) return R::failure(error);
     return result;
+}
+
+Result<Capture> parseCapture(std::string_view text, const std::string& name, size_t maxFrames) {
+    std::istringstream in{std::string(text)};
+    return parseCapture(in, name, maxFrames);
 }
 
 Result<Capture> readCapture(const std::string& path) {

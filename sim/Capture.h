@@ -6,6 +6,7 @@
 #include <istream>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "sim/Result.h"
@@ -44,7 +45,8 @@ struct Capture {
     // Shifted so that the first frame is queued at 0.
     std::vector<CaptureFrame> frames;
 
-    // The mean interval between frames (the span over the intervals; 1 s for a single frame).
+    // The mean interval between frames (the span over the intervals, at least 1 ns; 1 s for a
+    // single frame).
     nsecs_t meanInterval() const;
     // The rate the game ran at: 1 / the mean interval.
     double fps() const { return 1e9 / static_cast<double>(meanInterval()); }
@@ -56,6 +58,9 @@ struct Capture {
 
 // name stands for the input in error lines ("name:7: queue_ns is not a number").
 Result<Capture> parseCapture(std::istream& in, const std::string& name,
+                             size_t maxFrames = MAX_CAPTURE_FRAMES);
+// The same, from a capture's whole text in memory.
+Result<Capture> parseCapture(std::string_view text, const std::string& name,
                              size_t maxFrames = MAX_CAPTURE_FRAMES);
 Result<Capture> readCapture(const std::string& path);
 

@@ -44,6 +44,7 @@ struct WholeOption {
 const WholeOption WHOLE_OPTIONS[] = {
         {"--mode", &Options::mode, 0, 5},
         {"--slots", &Options::slots, 2, 64},
+        {"--layers", &Options::layers, 1, 16},
         {"--game-width", &Options::gameWidth, 1, 16384},
         {"--game-height", &Options::gameHeight, 1, 16384},
         {"--width", &Options::width, 16, 4096},
@@ -222,6 +223,9 @@ Display and library:
                        4 unlimited, 5 latency reduction
   --slots N          buffers of the game's queue, 2 to 64 (default: enough for the display
                      delay at the refresh rate; the queueSize setting fixes it too)
+  --layers N         copies of the game in the mode, 1 to 16 (default 1), each a layer with
+                     its own uid on the same display; the copies after the first are
+                     measured and summarised in a line each, without files of their own
   --client-composition SHARE
                      share of compositions, 0 to 1, that fall back to client (GPU)
                      composition, drawn from the seed (default 0)

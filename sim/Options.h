@@ -18,7 +18,8 @@ struct Options {
     double hz = 60;
     double clientCompositionShare = 0;  // compositions that fall back to client composition
     uint32_t mode = 0;
-    uint32_t slots = 0;  // buffer-queue slots; 0: sized by the reference host
+    uint32_t slots = 0;   // buffer-queue slots; 0: sized by the reference host
+    uint32_t layers = 1;  // copies of the game in the mode, each a layer of its own
     double durationSec = 10;
     bool durationGiven = false;  // without it, a capture plays to its end
     bool loop = false;           // replay the capture until the duration is over

@@ -50,6 +50,10 @@ Status Outputs::open(const std::vector<Layer>& layers, const Json::Value& option
     for (const Layer& layer : layers) {
         auto& out = *mLayers.emplace_back(
                 std::make_unique<LayerOutputs>(layer, mRefreshPeriod, mPictureFrom));
+        if (!layer.files) {
+            out.sinks.add(&out.measures);
+            continue;
+        }
         const std::string prefix = Outputs::prefix(layer.role);
         for (auto [name, file] : {std::pair{"frames.csv", &out.framesFile},
                                   std::pair{"refreshes.csv", &out.refreshesFile},
@@ -85,6 +89,7 @@ Status Outputs::finish() {
     mTraceFile.close();
     if (!mTraceFile) keep({errorLine("cannot write " + path("trace.json"))});
     for (auto& layer : mLayers) {
+        if (layer->frames == nullptr) continue;  // measured only
         const std::string prefix = Outputs::prefix(layer->role);
         for (auto [name, file] : {std::pair{"frames.csv", &layer->framesFile},
                                   std::pair{"refreshes.csv", &layer->refreshesFile},

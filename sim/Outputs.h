@@ -17,13 +17,15 @@ namespace verolux::sim {
 
 // The files of a run in its output folder, written as records come, and each layer's measures.
 // Per layer, the reference's names starting with "reference-": frames.csv, refreshes.csv,
-// presentmon.csv and the space-time rows (spacetime-rows.png); for both, trace.json.
+// presentmon.csv and the space-time rows (spacetime-rows.png); for all, trace.json. A layer
+// opened without files is only measured.
 class Outputs {
 public:
     struct Layer {
         std::string role;   // "run" or "reference"
         std::string title;  // "run: mode 0 retime"
         uint32_t uid = 0;
+        bool files = true;  // false: measured only, for a copy of a layer that has them
     };
     // The space-time picture's window: this long from its start, at most this many rows.
     static constexpr nsecs_t PICTURE_WINDOW = 2'000'000'000;

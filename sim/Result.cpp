@@ -14,15 +14,18 @@ std::string errorLine(std::string_view message) {
     return line;
 }
 
-std::string quoted(std::string_view text) {
-    std::string out = "\"";
-    for (size_t i = 0; i < text.size() && i < MAX_QUOTED_CHARS; i++) {
+std::string printable(std::string_view text, size_t maxChars) {
+    std::string out;
+    for (size_t i = 0; i < text.size() && i < maxChars; i++) {
         const auto c = static_cast<unsigned char>(text[i]);
         out += c < 0x20 || c == 0x7f ? '?' : static_cast<char>(c);
     }
-    if (text.size() > MAX_QUOTED_CHARS) out += "...";
-    out += '"';
+    if (text.size() > maxChars) out += "...";
     return out;
+}
+
+std::string quoted(std::string_view text) {
+    return "\"" + printable(text, MAX_QUOTED_CHARS) + "\"";
 }
 
 }  // namespace verolux::sim

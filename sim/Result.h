@@ -31,8 +31,11 @@ struct Status {
 // "verolux-sim: " followed by the message: every error line the simulator prints starts so.
 std::string errorLine(std::string_view message);
 
-// User text inside an error line, in double quotes: cut to 40 characters and with control
-// characters shown as '?', so that the line stays one line whatever the input held.
+// Text from the input inside an error line: cut to maxChars (then "...") and with control
+// characters shown as '?', so that the line stays one short line whatever the input held.
+std::string printable(std::string_view text, size_t maxChars);
+
+// User text inside an error line, in double quotes, printable and cut to 40 characters.
 std::string quoted(std::string_view text);
 
 }  // namespace verolux::sim

@@ -29,6 +29,7 @@ constexpr std::streamoff MAX_SETTINGS_FILE_BYTES = 1 << 20;
 constexpr int32_t MODE_ID = 7;
 constexpr int64_t MAX_MODE = 5;
 constexpr int MAX_SETTINGS_DEPTH = 16;
+constexpr size_t MAX_JSON_ERROR_CHARS = 100;
 
 std::string describe(const Json::Value& value) {
     if (value.isString()) return quoted(value.asString());
@@ -227,7 +228,8 @@ std::string valueFromJson(const SettingKey& key, const Json::Value& json, Settin
 }
 
 // jsoncpp reports "* Line 3, Column 5\n  Missing ',' or '}' in object declaration\n" per error;
-// keep the first one, on one line.
+// keep the first one, on one short line: jsoncpp quotes the offending text whole ("'1e999...' is
+// not a number.", "Duplicate key: '...'").
 std::string firstJsonError(const std::string& errors) {
     std::istringstream lines(errors);
     std::string where;
@@ -237,7 +239,7 @@ std::string firstJsonError(const std::string& errors) {
     where = std::string(trim(where));
     if (where.rfind("* ", 0) == 0) where.erase(0, 2);
     what = std::string(trim(what));
-    return what.empty() ? where : where + ": " + what;
+    return printable(what.empty() ? where : where + ": " + what, MAX_JSON_ERROR_CHARS);
 }
 
 }  // namespace

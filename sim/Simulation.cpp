@@ -41,7 +41,7 @@ struct SimulatedLayer {
         : queue(plan.buffers.count, options.width, Simulation::BUFFER_HEIGHT),
           recorder(new LayerRecorder(plan.uid, records)) {
         host::LayerHost::Config config;
-        config.name = android::String8(plan.role == "run" ? "game" : "reference");
+        config.name = android::String8(plan.name.c_str());
         config.uid = plan.uid;
         config.mode = static_cast<InterpolationMode>(plan.mode);
         config.frameListCapacity = plan.buffers.count;
@@ -66,7 +66,7 @@ void readWarnings(uint32_t uid, nsecs_t startTime, int64_t startWallMs, LayerRec
     parcel.setDataPosition(0);
     DecodedWarnings decoded = decodeWarnings(parcel);
     for (WarningRecord& warning : decoded.warnings) {
-        warning.time = startTime + (warning.wallMs - startWallMs) * MS;
+        warning.time = warningRunTime(warning.wallMs, startTime, startWallMs);
         recorder.warning(warning);
     }
     if (!decoded.error.empty()) {
@@ -88,8 +88,12 @@ Simulation::Simulation(const Options& options, std::vector<host::SettingValue> s
     message.push_back({GAME_FPS_LIMIT_ID, static_cast<int32_t>(std::lround(options.hz))});
     message.insert(message.end(), settings.begin(), settings.end());
 
-    mLayers.push_back({"run", GAME_UID, options.mode, {}});
-    if (options.reference) mLayers.push_back({"reference", REFERENCE_UID, 2, {}});
+    mLayers.push_back({"run", "game", GAME_UID, options.mode, {}});
+    if (options.reference) mLayers.push_back({"reference", "reference", REFERENCE_UID, 2, {}});
+    for (uint32_t copy = 2; copy <= options.layers; copy++) {
+        const std::string n = std::to_string(copy);
+        mLayers.push_back({"run-" + n, "game-" + n, copyUid(copy), options.mode, {}});
+    }
     for (LayerPlan& layer : mLayers) {
         host::deliverSettings(layer.uid, message);
         layer.buffers = options.slots > 0
@@ -159,7 +163,7 @@ RunResult Simulation::run(const std::vector<RecordSink*>& sinks,
             break;
         }
         if (now >= end) break;
-        // Both layers play the same capture; the run is over once both have played it out.
+        // Every layer plays the same capture; the run is over once all have played it out.
         bool captureOver = mCapture != nullptr && !mOptions.loop;
         for (auto& layer : layers) {
             const nsecs_t last = layer->game->captureEndTime();

@@ -13,9 +13,11 @@
 
 namespace verolux::sim {
 
-// A simulated layer as planned: the game in the chosen mode, or the same game in mode 2 beside it.
+// A simulated layer as planned: the game in the chosen mode, the same game in mode 2 beside it,
+// or another copy of the game in the chosen mode.
 struct LayerPlan {
-    std::string role;  // "run" or "reference"
+    std::string role;  // "run", "reference", or "run-2" and on for the copies
+    std::string name;  // the layer's name in the library's log lines and dumps
     uint32_t uid = 0;
     uint32_t mode = 0;
     host::BufferCount buffers;
@@ -31,12 +33,15 @@ struct RunResult {
 };
 
 // One run of verolux-sim in real time: the game and, unless left out, the same game (same seed
-// or capture) in mode 2 beside it, on one display, each through the reference host. The records
-// of each layer go to its sink from the calling thread, between the real-time threads' work.
+// or capture) in mode 2 beside it, then the game's further copies (--layers), on one display,
+// each through the reference host. The records of each layer go to its sink from the calling
+// thread, between the real-time threads' work.
 class Simulation {
 public:
     static constexpr uint32_t GAME_UID = 10'001;
     static constexpr uint32_t REFERENCE_UID = 10'002;
+    // Copy n (from 2) of the game takes the uid 10'001 + n, after the reference's.
+    static constexpr uint32_t copyUid(uint32_t copy) { return GAME_UID + copy; }
     static constexpr uint32_t BUFFER_HEIGHT = 4;
     // After the capture's last frame, long enough for it to reach the screen.
     static constexpr nsecs_t CAPTURE_TAIL = 250'000'000;

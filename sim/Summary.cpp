@@ -394,4 +394,26 @@ std::string formatSummary(const Summary& run, const Summary* reference) {
     return out;
 }
 
+std::string formatCopies(const std::vector<Summary>& copies) {
+    if (copies.empty()) return {};
+    std::string out = "Copies of the run (the same game and mode, each a layer of its own):\n";
+    for (const Summary& s : copies) {
+        const MeasuredLayer& m = s.measured;
+        const auto& p = m.pictures;
+        const auto newPictures =
+                perSecond(p[size_t(Picture::BLEND)] + p[size_t(Picture::NEW)], s.facts.runSec);
+        // Two pieces, each well within format()'s line.
+        out +=
+                format("  %s: animation error p95 %s ms, new pictures %s per second, latency p50 / "
+                       "p99 %s, ",
+                       s.facts.role.c_str(), number(m.errorP95Ms).c_str(),
+                       number(newPictures, "%.1f").c_str(),
+                       values({m.latencyP50Ms, m.latencyP99Ms}, "ms").c_str());
+        out += format("stutters %" PRIu64 ", vsyncs skipped %" PRIu64 ", warnings %" PRIu64
+                      ", interpolation %s\n",
+                      m.stutterCount, m.skippedVsyncs, m.warningCount, interpolation(s).c_str());
+    }
+    return out;
+}
+
 }  // namespace verolux::sim

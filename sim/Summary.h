@@ -60,4 +60,8 @@ std::vector<std::string> ledgerLines(const Summary& run, const Summary* referenc
 // watchdog warnings.
 std::string formatSummary(const Summary& run, const Summary* reference = nullptr);
 
+// The further copies of the run (--layers), a line each with the measures that tell them apart
+// from the run; empty without copies.
+std::string formatCopies(const std::vector<Summary>& copies);
+
 }  // namespace verolux::sim

@@ -1,5 +1,6 @@
 #include "sim/WarningLedger.h"
 
+#include <algorithm>
 #include <cinttypes>
 #include <cstdio>
 #include <ctime>
@@ -11,6 +12,8 @@ namespace verolux::sim {
 namespace {
 
 using android::Interpolation::WarningCode;
+
+constexpr int64_t DAY_MS = 24LL * 3600 * 1000;
 
 // Codes 1 and 3 carry a float; every other code an int32 (an invalid one a zero int32).
 bool carriesFloat(int32_t code) {
@@ -45,6 +48,14 @@ DecodedWarnings decodeWarnings(const android::Parcel& parcel) {
         position += WatchdogWarning::PARCEL_SIZE;
     }
     return out;
+}
+
+nsecs_t warningRunTime(int64_t wallMs, nsecs_t startTime, int64_t startWallMs) {
+    // A wall-clock time a day or more away from the run's start is not this run's (the clock was
+    // set, or the parcel is broken); it stays a day away, so that the arithmetic stays in range.
+    const int64_t offsetMs =
+            std::clamp(wallMs, startWallMs - DAY_MS, startWallMs + DAY_MS) - startWallMs;
+    return startTime + offsetMs * 1'000'000;
 }
 
 std::string warningCodeName(int32_t code) {

@@ -23,6 +23,10 @@ struct DecodedWarnings {
 
 DecodedWarnings decodeWarnings(const android::Parcel& parcel);
 
+// A warning's time on the run's monotonic clock, from its wall-clock time (ms) and the run's start
+// on both clocks; at most a day from the start.
+nsecs_t warningRunTime(int64_t wallMs, nsecs_t startTime, int64_t startWallMs);
+
 // "LOW_GAME_FPS", ...; "code N" for a code the library does not define.
 std::string warningCodeName(int32_t code);
 

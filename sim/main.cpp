@@ -115,6 +115,7 @@ Json::Value runJson(const std::vector<std::pair<std::string, std::string>>& desc
     json["refresh_period_ns"] = Json::Int64(simulation.refreshPeriod());
     json["picture_from_s"] = options.pictureAtSec;
     for (const Outputs::Layer& layer : layers) {
+        if (!layer.files) continue;  // the figures draw the layers that have files
         Json::Value entry(Json::objectValue);
         entry["role"] = layer.role;
         entry["title"] = layer.title;
@@ -156,8 +157,11 @@ int main(int argc, char** argv) {
 
     Simulation simulation(options, settings.value, capture ? &*capture : nullptr);
     std::vector<Outputs::Layer> layers;
+    // The copies of the run (--layers) are measured only: their files would repeat the run's.
+    const size_t withFiles = options.reference ? 2 : 1;
     for (const LayerPlan& plan : simulation.layers()) {
-        layers.push_back({plan.role, plan.role + ": mode " + modeText(plan.mode), plan.uid});
+        layers.push_back({plan.role, plan.role + ": mode " + modeText(plan.mode), plan.uid,
+                          layers.size() < withFiles});
     }
     const auto described = describe(options, capture, settings.value, simulation);
     const Json::Value runDescription = runJson(described, simulation, layers, options);
@@ -175,11 +179,12 @@ int main(int argc, char** argv) {
     installInterruptHandler();
     if (!options.quiet) {
         std::cerr << "verolux-sim: mode " << modeText(options.mode)
+                  << (options.layers > 1 ? " (" + std::to_string(options.layers) + " layers)" : "")
                   << (options.reference ? " against mode 2 no interpolation" : "") << "; "
                   << gameText(options, capture) << " on a " << plain(options.hz) << " Hz display; "
                   << simulation.layers().front().buffers.count << " buffers";
         if (options.reference) {
-            std::cerr << " (reference " << simulation.layers().back().buffers.count << ")";
+            std::cerr << " (reference " << simulation.layers()[1].buffers.count << ")";
         }
         std::cerr << "; " << durationText(options, capture)
                   << ". Ctrl-C stops early and keeps the results." << std::endl;
@@ -226,8 +231,10 @@ int main(int argc, char** argv) {
         facts.captureEnded = result.captureEnded;
         summaries.push_back({facts, measured});
     }
-    const Summary* reference = summaries.size() > 1 ? &summaries[1] : nullptr;
-    const std::string summary = formatSummary(summaries[0], reference);
+    const Summary* reference = options.reference ? &summaries[1] : nullptr;
+    const std::vector<Summary> copies(summaries.begin() + (options.reference ? 2 : 1),
+                                      summaries.end());
+    const std::string summary = formatSummary(summaries[0], reference) + formatCopies(copies);
     {
         std::ofstream file(out / "summary.txt");
         file << summary;

@@ -242,6 +242,15 @@ TEST(WarningLedgerTest, decodesEachRecordByItsCodeAndStopsAtABrokenOne) {
     EXPECT_EQ("   90.00 s  22:13:20.123 UTC  reference  LATENCY_REDUCTION_UNSTABLE  0.500",
               sim::ledgerLine(decoded.warnings[1], 0, "reference"));
     EXPECT_EQ("code 7", sim::warningCodeName(7));
+
+    // On the run's clock; a wall-clock time from a broken parcel once overflowed the conversion.
+    constexpr nsecs_t START = 5 * SECOND;
+    constexpr int64_t START_WALL_MS = 1'700'000'000'000;
+    constexpr nsecs_t DAY = 24 * 3600 * SECOND;
+    EXPECT_EQ(START + 1'500'000'000,
+              sim::warningRunTime(START_WALL_MS + 1500, START, START_WALL_MS));
+    EXPECT_EQ(START + DAY, sim::warningRunTime(INT64_MAX, START, START_WALL_MS));
+    EXPECT_EQ(START - DAY, sim::warningRunTime(INT64_MIN, START, START_WALL_MS));
 }
 
 }  // namespace

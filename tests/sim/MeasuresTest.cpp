@@ -113,10 +113,12 @@ struct CollectingSink : RecordSink {
 
 TEST(LayerRecorderTest, namesWhatTheScreenShowedAndPassesFramesOnInOrder) {
     CollectingSink sink;
-    LayerRecorder recorder(1, sink);
+    // Held as the simulator holds it: a reference-counted object frees its counts with the last
+    // strong reference.
+    const android::sp<LayerRecorder> recorder = new LayerRecorder(1, sink);
     for (uint64_t n = 1; n <= 3; n++) {
-        recorder.frameDequeued(n, static_cast<int>(n), 1000 * static_cast<nsecs_t>(n), 0, 0);
-        recorder.frameQueued(n, 10 * static_cast<nsecs_t>(n));
+        recorder->frameDequeued(n, static_cast<int>(n), 1000 * static_cast<nsecs_t>(n), 0, 0);
+        recorder->frameQueued(n, 10 * static_cast<nsecs_t>(n));
     }
     // Items (frame, weight): a blend, the same blend, a single new frame, an empty state, the
     // frame from before the empty state again.
@@ -128,12 +130,12 @@ TEST(LayerRecorderTest, namesWhatTheScreenShowedAndPassesFramesOnInOrder) {
         r.presentTime = 100 * static_cast<nsecs_t>(i + 1);
         for (const auto& [frame, weight] : states[i])
             r.items[r.itemCount++] = {frame, weight, weight};
-        recorder.composed(r);
-        recorder.refreshed(r);
+        recorder->composed(r);
+        recorder->refreshed(r);
     }
-    recorder.frameReleased(2, 600);  // waits for frame 1
-    recorder.frameReleased(1, 700);
-    recorder.finish();  // frame 3, never released
+    recorder->frameReleased(2, 600);  // waits for frame 1
+    recorder->frameReleased(1, 700);
+    recorder->finish();  // frame 3, never released
 
     std::vector<std::string> pictures;
     std::vector<double> contents;

@@ -118,6 +118,9 @@ TEST(OptionsTest, badSettingsJsonNamesTheFileAndTheProblem) {
             {R"({"delayMs": 40 "mode": 1})",
              "invalid JSON: Line 1, Column 16: Missing ',' or '}' in object declaration"},
             {R"({"mode": 1, "mode": 2})", "invalid JSON: Line 1, Column 13: Duplicate key: 'mode'"},
+            // jsoncpp quotes a bad number whole; it once made a line as long as the number.
+            {"{\"mode\": 1" + std::string(300, '0') + "e}",
+             "invalid JSON: Line 1, Column 10: '1" + std::string(79, '0') + "..."},
     };
     for (const auto& [text, message] : cases) {
         EXPECT_EQ("verolux-sim: s.json: " + message, parseSettingsJson(text, "s.json").error);

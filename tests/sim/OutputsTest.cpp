@@ -176,6 +176,21 @@ TEST(SummaryTest, findingsSayWhetherMotionGotSmootherAndWhatItCost) {
                     "behind real time, so these measures are not what a device would show."));
     EXPECT_THAT(formatSummary(run), testing::HasSubstr("  buffers                               "
                                                        "14, 112.0 MiB at 1920x1080\n"));
+
+    Summary copy = run;
+    copy.facts.role = "run-2";
+    copy.measured.pictures = {900, 300, 0, 0};
+    copy.measured.latencyP99Ms = 80.25;
+    copy.measured.skippedVsyncs = 3;
+    copy.measured.warningCount = 1;
+    copy.measured.interpolatedAtAll = true;
+    EXPECT_EQ(
+            "Copies of the run (the same game and mode, each a layer of its own):\n"
+            "  run-2: animation error p95 4.50 ms, new pictures 120.0 per second, latency p50 / "
+            "p99 69.50 / 80.25 ms, stutters 0, vsyncs skipped 3, warnings 1, interpolation on "
+            "throughout\n",
+            formatCopies({copy}));
+    EXPECT_EQ("", formatCopies({}));
 }
 
 }  // namespace

@@ -1,7 +1,9 @@
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <chrono>
 #include <thread>
+#include <tuple>
 
 #include "sim/Simulation.h"
 
@@ -42,8 +44,10 @@ TEST_P(SimulationTest, showsAPictureAtEveryRefreshAndHandsEveryBufferBack) {
     const RunResult result = simulation.run({&sink}, false, nullptr);
     EXPECT_LT(steady_clock::now() - start, 1500ms);  // tear-down included
     EXPECT_FALSE(result.interrupted);
-    ASSERT_GE(sink.refreshes.size(), 40u);  // 48 at 60 Hz, less what a busy machine drops
-    ASSERT_GE(sink.frames.size(), 15u);
+    // 48 refreshes at 60 Hz and 24 frames at 30 fps, less what a busy machine or a sanitizer
+    // build drops (a third of the refreshes under AddressSanitizer on two shared cores).
+    ASSERT_GE(sink.refreshes.size(), 24u);
+    ASSERT_GE(sink.frames.size(), 12u);
     // Once the game's first frame is on screen, the layer always shows a picture.
     for (const RefreshRecord& refresh : sink.refreshes)
         EXPECT_TRUE(refresh.presentTime < simulation.startTime() + 150'000'000 ||
@@ -58,26 +62,33 @@ TEST_P(SimulationTest, showsAPictureAtEveryRefreshAndHandsEveryBufferBack) {
 
 INSTANTIATE_TEST_SUITE_P(AllModes, SimulationTest, testing::Range(0u, 6u));
 
-TEST(SimulationInterruptTest, stopsEarlyAndKeepsWhatItRecorded) {
+// The reference and a further copy of the game, each a layer of its own beside the run.
+TEST(SimulationInterruptTest, stopsEarlyAndKeepsWhatEveryLayerRecorded) {
     Options options = shortRun(0);
     options.durationSec = 30;
     options.reference = true;
+    options.layers = 2;
     Simulation simulation(options, {}, nullptr);
-    ASSERT_EQ(2u, simulation.layers().size());
-    EXPECT_EQ(2u, simulation.layers()[1].mode);
+    std::vector<std::tuple<std::string, std::string, uint32_t, uint32_t>> plans;
+    for (const LayerPlan& plan : simulation.layers())
+        plans.emplace_back(plan.role, plan.name, plan.uid, plan.mode);
+    EXPECT_THAT(plans, testing::ElementsAre(std::tuple("run", "game", 10'001u, 0u),
+                                            std::tuple("reference", "reference", 10'002u, 2u),
+                                            std::tuple("run-2", "game-2", 10'003u, 0u)));
     std::atomic<bool> interrupted{false};
     std::thread interrupter([&] {
         std::this_thread::sleep_for(500ms);
         interrupted = true;
     });
-    CollectingSink run, reference;
+    CollectingSink run, reference, copy;
     const auto start = steady_clock::now();
-    const RunResult result = simulation.run({&run, &reference}, interrupted, nullptr);
+    const RunResult result = simulation.run({&run, &reference, &copy}, interrupted, nullptr);
     interrupter.join();
     EXPECT_LT(steady_clock::now() - start, 2s);
     EXPECT_TRUE(result.interrupted);
-    EXPECT_GE(run.refreshes.size(), 5u);
-    EXPECT_GE(reference.refreshes.size(), 5u);
+    for (const CollectingSink* sink : {&run, &reference, &copy})
+        EXPECT_GE(sink->refreshes.size(), 5u);
+    EXPECT_NE(std::string::npos, result.dump.find("[game-2]")) << result.dump;
 }
 
 }  // namespace

@@ -33,7 +33,8 @@ std::vector<uint32_t> fetchWarnings(uint32_t uid) {
     Parcel parcel;
     WatchdogWarningController::writeWarningsToParcel(uid, &parcel);
     std::vector<uint32_t> words(parcel.dataSize() / 4);
-    std::memcpy(words.data(), parcel.data(), words.size() * 4);
+    // An empty parcel has no data pointer, which memcpy may not be given even for no bytes.
+    if (!words.empty()) std::memcpy(words.data(), parcel.data(), words.size() * 4);
     return words;
 }
 
