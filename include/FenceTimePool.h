@@ -32,7 +32,14 @@ private:
     template <typename T>
     class Allocator;
 
-    static constexpr size_t BLOCK_SIZE = 64;
+    // A shared FenceTime and its reference counts: the wrapper itself plus the control block's
+    // virtual table, two counts and the allocator, with room to spare for other standard
+    // libraries' layouts. Sized from the platform's own FenceTime, so a device build's larger one
+    // fits too; the allocator checks it at compile time.
+    static constexpr size_t CONTROL_BLOCK_ROOM = 48;
+    static constexpr size_t BLOCK_SIZE =
+            (sizeof(FenceTime) + CONTROL_BLOCK_ROOM + alignof(std::max_align_t) - 1) /
+            alignof(std::max_align_t) * alignof(std::max_align_t);
     static constexpr size_t BLOCKS_PER_CHUNK = 16;
     union Block {
         Block* next;  // while free
