@@ -28,18 +28,6 @@ constexpr nsecs_t RENDER_TIME = 4 * MS;
 constexpr nsecs_t DISPLAY_LAG = 2 * FRAME_PERIOD;
 constexpr int BUFFERS = 8;
 
-// A thread that lives as long as the process, started before any benchmark: a single-threaded
-// process takes cheaper paths (reference counts without atomics) than a compositor ever does.
-const bool sSecondThreadStarted = [] {
-    std::thread([] {
-        std::mutex mutex;
-        std::condition_variable never;
-        std::unique_lock lock(mutex);
-        never.wait(lock, [] { return false; });
-    }).detach();
-    return true;
-}();
-
 nsecs_t threadCpuTime() {
     timespec ts{};
     clock_gettime(CLOCK_THREAD_CPUTIME_ID, &ts);

@@ -4,6 +4,7 @@
 #include <mutex>
 
 #include "AllocationCounter.h"
+#include "BenchReceivers.h"
 #include "EventDispatcher.h"
 #include "RFPSAgent.h"
 #include "RefreshRateDetector.h"
@@ -35,12 +36,6 @@ void BM_RefreshRateDetectorAddVsync(benchmark::State& state) {
         detector->addVsync(vsync += PERIOD);
 }
 BENCHMARK(BM_RefreshRateDetectorAddVsync);
-
-// Stands for the layer's ring log, which receives every refusal.
-class NullReceiver : public EventDispatcher::EventReceiver {
-public:
-    void onEvent(const EventType&, const nsecs_t&, const EventData&) override {}
-};
 
 // A fixed render rate of 1 Hz, so that nearly every refresh falls between two fake vsyncs: with
 // a make-up chance in hand it presents (refused = 0), without one it refuses and announces it to

@@ -3,6 +3,7 @@
 #include <vector>
 
 #include "AllocationCounter.h"
+#include "BenchReceivers.h"
 #include "FrameTimings.h"
 #include "RollingStatistics.h"
 
@@ -33,12 +34,6 @@ void BM_RollingPercentileUpdateFullRing(benchmark::State& state) {
     }
 }
 BENCHMARK(BM_RollingPercentileUpdateFullRing);
-
-// Stands for the layer's ring log: a receiver of every event that does nothing.
-class NullReceiver : public EventDispatcher::EventReceiver {
-public:
-    void onEvent(const EventType&, const nsecs_t&, const EventData&) override {}
-};
 
 // One frame's life as the host reports it, through three buffers in turn.
 void BM_AggregatorFrameStages(benchmark::State& state) {

@@ -69,8 +69,8 @@ RenderState RenderStateBuilder::newState() {
     return state;
 }
 
-void RenderStateBuilder::pushFrame(RenderState& state, const FrameItem& frame) {
-    state.items.push_back(RenderItem{frame, 0.0f, 0});
+void RenderStateBuilder::pushFrame(RenderState& state, FrameItem frame) {
+    state.items.push_back(RenderItem{std::move(frame), 0.0f, 0});
 }
 
 RenderState RenderStateBuilder::announce(EventType kind, RenderState&& state) const {

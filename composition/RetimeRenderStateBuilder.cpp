@@ -42,64 +42,67 @@ float RetimeRenderStateBuilder::getAlphaFromFunction(float x) {
 }
 
 RenderState RetimeRenderStateBuilder::getFramesFor(nsecs_t const& displayTime) {
-    const FrameItem before = mFrameList->getFrameBefore(displayTime);
-    const FrameItem after = mFrameList->getFrameAfter(displayTime);
     RenderState state = newState();
-
-    if (before.isValid() && after.isValid()) {
-        const float alpha =
-                getAlphaFromFunction(positionBetween(displayTime, before.mID, after.mID));
-        ILOG(2,
-             "Interpolation::RetimeRenderStateBuilder [%s] getFramesFor: Retime interpolating "
-             "with alpha %f",
-             mName.c_str(), alpha);
-        if (alpha < 1.0f) pushFrame(state, mFrameList->getFrameBeforeAndLock(displayTime));
-        if (alpha > 0.0f) {
-            pushFrame(state, mFrameList->getFrameAfterAndLock(displayTime));
-        } else if (!state.items.empty() && state.items[0].frame.mID == mLastStateDisplayTime) {
-            // The earlier frame is already on screen: blend towards the next one rather than show
-            // it alone once more.
-            pushFrame(state, mFrameList->getFrameAfterAndLock(displayTime));
+    EventType kind = eRepeatedCompositionEvent;
+    bool picked = true;
+    {
+        // What is composed is decided from the neighbours' display times and readiness alone, and
+        // the frames chosen are locked without the list changing in between.
+        FrameList::NeighbourPick pick(*mFrameList, displayTime);
+        const FrameList::Neighbours& around = pick.neighbours();
+        if (around.beforeValid && around.afterValid) {
+            const float alpha = getAlphaFromFunction(
+                    positionBetween(displayTime, around.beforeID, around.afterID));
+            ILOG(2,
+                 "Interpolation::RetimeRenderStateBuilder [%s] getFramesFor: Retime interpolating "
+                 "with alpha %f",
+                 mName.c_str(), alpha);
+            if (alpha < 1.0f) pushFrame(state, pick.lockBefore());
+            if (alpha > 0.0f) {
+                pushFrame(state, pick.lockAfter());
+            } else if (!state.items.empty() && state.items[0].frame.mID == mLastStateDisplayTime) {
+                // The earlier frame is already on screen: blend towards the next one rather than
+                // show it alone once more.
+                pushFrame(state, pick.lockAfter());
+            }
+            kind = eBlendedCompositionEvent;
+        } else if (around.beforeValid) {
+            FrameItem shown = pick.lockBefore();
+            if (!shown.isValid()) return RenderState();  // gone meanwhile
+            kind = shown.mID == mLastStateDisplayTime ? eRepeatedCompositionEvent
+                                                      : eNewFrameCompositionEvent;
+            pushFrame(state, std::move(shown));
+        } else if (around.afterValid) {
+            pushFrame(state, pick.lockAfter());
+            kind = eNewFrameCompositionEvent;
+        } else {
+            picked = false;
         }
-        return announce(eBlendedCompositionEvent, std::move(state));
-    }
-
-    if (before.isValid()) {
-        const FrameItem shown = mFrameList->getFrameBeforeAndLock(displayTime);
-        if (!shown.isValid()) return RenderState();  // gone meanwhile
-        pushFrame(state, shown);
-        return announce(shown.mID == mLastStateDisplayTime ? eRepeatedCompositionEvent
-                                                           : eNewFrameCompositionEvent,
-                        std::move(state));
-    }
-
-    if (after.isValid()) {
-        pushFrame(state, mFrameList->getFrameAfterAndLock(displayTime));
-        return announce(eNewFrameCompositionEvent, std::move(state));
     }
 
     // Neither neighbour is usable: hold the last picture, or failing that the newest ready frame.
-    const FrameItem last = mFrameList->getFrameAtAndLock(mLastStateDisplayTime);
-    if (last.isValid()) {
-        pushFrame(state, last);
-    } else if (const FrameItem newest = mFrameList->getLatestValidFrameAndLock(); newest.isValid()) {
-        pushFrame(state, newest);
-    } else {
-        ILOG(1, "Interpolation::RetimeRenderStateBuilder [%s]: no valid frame!", mName.c_str());
+    if (!picked) {
+        if (FrameItem last = mFrameList->getFrameAtAndLock(mLastStateDisplayTime); last.isValid()) {
+            pushFrame(state, std::move(last));
+        } else if (FrameItem newest = mFrameList->getLatestValidFrameAndLock(); newest.isValid()) {
+            pushFrame(state, std::move(newest));
+        } else {
+            ILOG(1, "Interpolation::RetimeRenderStateBuilder [%s]: no valid frame!", mName.c_str());
+        }
     }
-    return announce(eRepeatedCompositionEvent, std::move(state));
+    return announce(kind, std::move(state));
 }
 
 RenderState RetimeRenderStateBuilder::setupFramesFor(RenderState&& state,
                                                      nsecs_t const& displayTime) {
-    state = setupOpaqueFrame(std::move(state));
-    if (state.items.size() > 1) {
-        RenderItem& later = state.items[1];
+    RenderState opaque = setupOpaqueFrame(std::move(state));
+    if (opaque.items.size() > 1) {
+        RenderItem& later = opaque.items[1];
         later.alpha = getAlphaFromFunction(
-                positionBetween(displayTime, state.items[0].frame.mID, later.frame.mID));
+                positionBetween(displayTime, opaque.items[0].frame.mID, later.frame.mID));
         later.blend = 1;
     }
-    return std::move(state);
+    return opaque;
 }
 
 }  // namespace android::Interpolation

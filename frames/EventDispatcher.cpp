@@ -1,6 +1,7 @@
 #include "EventDispatcher.h"
 
 #include <algorithm>
+#include <new>
 
 #include "DeferredRelease.h"
 #include "Log.h"
@@ -25,20 +26,59 @@ void* promotedPointer(const wp<EventDispatcher::EventReceiver>& receiver) {
 
 }  // namespace
 
-EventDispatcher& EventDispatcher::getInstanceLocked() {
-    if (mInstance == nullptr) mInstance.reset(new EventDispatcher());
-    return *mInstance;
-}
+// The receivers one broadcast has called. Their strong references are dropped only once the bus's
+// mutex is released: dropping the last one runs the receiver's onLastStrongRef, which unsubscribes
+// and so takes that mutex. The first ON_STACK of them stay on the broadcasting thread's stack;
+// any more wait in the thread's DeferredRelease.
+class EventDispatcher::CalledReceivers {
+public:
+    CalledReceivers() {}
+    ~CalledReceivers() {
+        for (size_t i = 0; i < mCount; i++)
+            mSlots[i].receiver.~sp();
+        if (mDeferred) DeferredRelease<EventReceiver>::releaseAll();
+    }
+    CalledReceivers(const CalledReceivers&) = delete;
+    CalledReceivers& operator=(const CalledReceivers&) = delete;
+
+    void hold(sp<EventReceiver>&& receiver) {
+        if (mCount < ON_STACK) {
+            new (&mSlots[mCount++].receiver) sp<EventReceiver>(std::move(receiver));
+        } else {
+            DeferredRelease<EventReceiver>::hold(std::move(receiver));
+            mDeferred = true;
+        }
+    }
+
+    // Leaves every reference to the thread's next DeferredRelease<EventReceiver>::releaseAll().
+    void deferAll() {
+        for (size_t i = 0; i < mCount; i++) {
+            DeferredRelease<EventReceiver>::hold(std::move(mSlots[i].receiver));
+            mSlots[i].receiver.~sp();
+        }
+        mCount = 0;
+        mDeferred = false;
+    }
+
+private:
+    static constexpr size_t ON_STACK = 32;
+    // Constructed and destroyed one by one, so that a broadcast pays only for the receivers it
+    // called.
+    union Slot {
+        Slot() {}
+        ~Slot() {}
+        sp<EventReceiver> receiver;
+    };
+    Slot mSlots[ON_STACK];
+    size_t mCount = 0;
+    bool mDeferred = false;
+};
 
 void EventDispatcher::broadcastEvent(const uint32_t& uid, const EventType& type,
                                      const nsecs_t& time, const EventData& data) {
-    {
-        std::lock_guard lock(mMutex);
-        getInstanceLocked().broadcastEventLocked(uid, type, time, data);
-    }
-    // The receivers called keep their references until here, so that one whose last reference
-    // goes can unsubscribe.
-    DeferredRelease<EventReceiver>::releaseAll();
+    CalledReceivers called;
+    std::lock_guard lock(mMutex);
+    getInstanceLocked().deliverLocked(uid, type, time, data, called);
 }
 
 void EventDispatcher::subscribe(const uint32_t& uid, const uint32_t& flags,
@@ -59,17 +99,30 @@ void EventDispatcher::unsubscribe(const uint32_t& uid, const uint32_t& flags,
 
 void EventDispatcher::broadcastEventLocked(const uint32_t& uid, const EventType& type,
                                            const nsecs_t& time, const EventData& data) {
-    auto entry = mSubscriptions.find(uid);
-    if (entry == mSubscriptions.end()) {
+    CalledReceivers called;
+    deliverLocked(uid, type, time, data, called);
+    called.deferAll();
+}
+
+void EventDispatcher::deliverLocked(uint32_t uid, EventType type, nsecs_t time,
+                                    const EventData& data, CalledReceivers& called) {
+    std::vector<Subscription>* subscriptions = uid == mLastUid ? mLastSubscriptions : nullptr;
+    if (subscriptions == nullptr) {
+        auto entry = mSubscriptions.find(uid);
+        if (entry == mSubscriptions.end()) {
+            ILOG(1, "EventDispatcher::broadcastEventLocked no subscribers for uid %d", uid);
+            return;
+        }
+        subscriptions = &entry->second;
+    }
+    if (subscriptions->empty()) {
         ILOG(1, "EventDispatcher::broadcastEventLocked no subscribers for uid %d", uid);
+        eraseLocked(uid);
         return;
     }
-    if (entry->second.empty()) {
-        ILOG(1, "EventDispatcher::broadcastEventLocked no subscribers for uid %d", uid);
-        mSubscriptions.erase(entry);
-        return;
-    }
-    for (const auto& [flags, receiver] : entry->second) {
+    mLastUid = uid;
+    mLastSubscriptions = subscriptions;
+    for (const auto& [flags, receiver] : *subscriptions) {
         if ((flags & type) == 0) continue;
         sp<EventReceiver> strong = receiver.promote();
         if (strong == nullptr) {
@@ -81,8 +134,13 @@ void EventDispatcher::broadcastEventLocked(const uint32_t& uid, const EventType&
             continue;
         }
         strong->onEvent(type, time, data);
-        DeferredRelease<EventReceiver>::hold(std::move(strong));
+        called.hold(std::move(strong));
     }
+}
+
+void EventDispatcher::eraseLocked(uint32_t uid) {
+    mSubscriptions.erase(uid);
+    if (uid == mLastUid) mLastSubscriptions = nullptr;
 }
 
 void EventDispatcher::subscribeLocked(const uint32_t& uid, const uint32_t& flags,
@@ -107,7 +165,7 @@ void EventDispatcher::unsubscribeLocked(const uint32_t& uid, const uint32_t& fla
     std::vector<Subscription>& subscriptions = entry->second;
     if (subscriptions.empty()) {
         ILOG(1, "EventDispatcher::unsubscribeLocked no subscribers for uid %d", uid);
-        mSubscriptions.erase(entry);
+        eraseLocked(uid);
         return;
     }
     auto found =

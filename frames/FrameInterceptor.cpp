@@ -1,7 +1,5 @@
 #include "FrameInterceptor.h"
 
-#include <memory>
-
 #include "Tunables.h"
 
 namespace android::Interpolation {
@@ -31,7 +29,7 @@ void FrameInterceptor::interceptFrame(const uint64_t& frameNumber, const int& sl
 
     mTimings->frameNumberForIndex(frameNumber, slot);
     if (!acquired) mTimings->queueTimings(systemTime(SYSTEM_TIME_MONOTONIC), slot);
-    mTimings->acquireFenceTimings(std::make_shared<FenceTime>(acquireFence), slot);
+    mTimings->acquireFenceTimings(mTimings->wrapFence(acquireFence), slot);
     mTimings->checkFenceTimes(slot);
 
     const nsecs_t delay = mDelayer != nullptr ? mDelayer->getDelay() : 0;

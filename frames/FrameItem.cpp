@@ -18,20 +18,40 @@ void FrameItem::update(const FrameItem& other) {
     mID = other.mID;
     mIndex = other.mIndex;
     mTextureSlot = other.mTextureSlot;
-    mGraphicBuffer = other.mGraphicBuffer;
+    // A frame's acquire call usually brings the same buffer and fence again; assigning them anew
+    // would only take and drop references.
+    if (mGraphicBuffer != other.mGraphicBuffer) mGraphicBuffer = other.mGraphicBuffer;
     mTimestamp = other.mTimestamp;
-    mAcquireFence = other.mAcquireFence;
+    if (mAcquireFence != other.mAcquireFence) mAcquireFence = other.mAcquireFence;
+    // What either copy has seen of the fence kept.
+    if (other.mSignalledFence == mAcquireFence.get()) {
+        mSignalledFence = other.mSignalledFence;
+    } else if (mSignalledFence != mAcquireFence.get()) {
+        mSignalledFence = nullptr;
+    }
     mAcquired = mAcquired || other.mAcquired;
 }
 
 bool FrameItem::isReady() const {
-    // Acquired frames skip the fence poll, which costs a syscall.
-    return mAcquired || mAcquireFence == nullptr || mAcquireFence->wait(0) == NO_ERROR;
+    // Acquired frames, and fences seen signalled before, skip the poll, which costs a syscall.
+    return mAcquired || mAcquireFence == nullptr || mSignalledFence == mAcquireFence.get() ||
+           mAcquireFence->wait(0) == NO_ERROR;
 }
 
 namespace Interpolation {
 
 nsecs_t RenderState::meanFrameID() const {
+    // A state holds one or two items: their divisors are constants, which cost no division.
+    switch (items.size()) {
+        case 0:
+            return 0;
+        case 1:
+            return items[0].frame.mID;
+        case 2:
+            return items[0].frame.mID / 2 + items[1].frame.mID / 2;
+        default:
+            break;
+    }
     const nsecs_t count = static_cast<nsecs_t>(items.size());
     nsecs_t mean = 0;
     for (const RenderItem& item : items) {

@@ -12,9 +12,27 @@ using Interpolation::EventDispatcher;
 using Interpolation::EventType;
 using Interpolation::UniqueLock;
 
-void FrameList::FrameDeque::insert(const_iterator position, const FrameItem& frame) {
-    mFrames.insert(position, frame);
-    broadcastEvent<Interpolation::eFrameReceivedEvent>(frame);
+namespace {
+
+// Enough for the frames a layer queues at the longest display delay and the highest frame rate;
+// a deeper queue grows the storage once.
+constexpr size_t RESERVED_FRAMES = 32;
+
+// A removed frame as the removals return it: alone if it was valid, else nothing.
+std::vector<FrameItem> validOnly(FrameItem removed) {
+    std::vector<FrameItem> frames;
+    if (removed.isValid()) frames.push_back(std::move(removed));
+    return frames;
+}
+
+}  // namespace
+
+FrameList::FrameDeque::FrameDeque(uint32_t uid) : mUid(uid) {
+    mFrames.reserve(RESERVED_FRAMES);
+}
+
+void FrameList::FrameDeque::insert(const_iterator position, FrameItem frame) {
+    broadcastEvent<Interpolation::eFrameReceivedEvent>(*mFrames.insert(position, std::move(frame)));
 }
 
 FrameItem FrameList::FrameDeque::erase(const_iterator position) {
@@ -26,13 +44,18 @@ FrameItem FrameList::FrameDeque::erase(const_iterator position) {
 }
 
 template <EventType type>
-void FrameList::FrameDeque::broadcastEvent(const FrameItem& frame) {
+void FrameList::FrameDeque::broadcastEvent(FrameItem& frame) {
     static_assert(type == Interpolation::eFrameReceivedEvent ||
                   type == Interpolation::eFrameReleasedEvent);
     const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
     const int size = static_cast<int>(mFrames.size());
     const int sizeBefore = type == Interpolation::eFrameReceivedEvent ? size - 1 : size + 1;
-    EventDispatcher::broadcastEvent(mUid, type, now, frame);
+    // Receivers get the frame by reference and copy what they keep, and none can reach the list
+    // meanwhile (its mutex is held), so the frame itself is lent to the event: no references are
+    // taken and dropped for it.
+    Interpolation::EventData data(std::move(frame));
+    EventDispatcher::broadcastEvent(mUid, type, now, data);
+    frame = std::move(std::get<FrameItem>(data));
     EventDispatcher::broadcastEvent(mUid, Interpolation::eFrameListSizeChangedEvent, now - 1,
                                     sizeBefore);
     EventDispatcher::broadcastEvent(mUid, Interpolation::eFrameListSizeChangedEvent, now, size);
@@ -46,21 +69,26 @@ FrameList::FrameList(uint32_t uid) : mFrames(uid) {
 void FrameList::insertFrame(FrameItem frame) {
     std::lock_guard lock(mMutex);
     ILOG(2, "Interpolation::FrameList insertFrame frame %lu", frame.mID);
+    // One walk finds both a queued copy of the frame and, behind frames of equal mID so that they
+    // keep their order of arrival, the place of a new one.
+    size_t position = mFrames.size();
     for (size_t i = 0; i < mFrames.size(); i++) {
-        if (mFrames[i].mTimestamp == frame.mTimestamp) {
+        const FrameItem& queued = mFrames[i];
+        if (queued.mTimestamp == frame.mTimestamp) {
             ILOG(2, "Interpolation::FrameList attempted to insert duplicate frame %lu", frame.mID);
             mFrames[i].update(frame);
             return;
         }
+        if (position == mFrames.size() && queued.mID > frame.mID) position = i;
     }
-    insertFrameLocked(frame);
+    mFrames.insert(mFrames.begin() + static_cast<ptrdiff_t>(position), std::move(frame));
 }
 
-void FrameList::insertFrameLocked(const FrameItem& frame) {
+void FrameList::insertFrameLocked(FrameItem frame) {
     // Behind frames of equal mID, so that they keep their order of arrival.
     auto position = std::find_if(mFrames.begin(), mFrames.end(),
                                  [&](const FrameItem& queued) { return queued.mID > frame.mID; });
-    mFrames.insert(position, frame);
+    mFrames.insert(position, std::move(frame));
 }
 
 void FrameList::replaceFrame(FrameItem out, FrameItem in) {
@@ -74,7 +102,7 @@ void FrameList::replaceFrame(FrameItem out, FrameItem in) {
         return;
     }
     mFrames.erase(found);
-    insertFrameLocked(in);
+    insertFrameLocked(std::move(in));
 }
 
 bool FrameList::hasFrameLocked(const FrameItem& frame) const {
@@ -119,22 +147,42 @@ FrameItem FrameList::getFrameAt(const nsecs_t& t) {
     return getFrameAtLocked(t);
 }
 
-FrameItem FrameList::getFrameAt(const nsecs_t& t, int index) {
+FrameItem* FrameList::frameAtLocked(nsecs_t t, int index, bool& valid) {
+    valid = false;
     if (index == 0) {
         ILOG(1, "FrameList received an invalid index");
-        return FrameItem();
+        return nullptr;
     }
     if (mFrames.empty()) {
         ILOG(1, "FrameList is empty");
-        return FrameItem();
+        return nullptr;
     }
     // An oldest frame that is not valid yet counts as index 0, so that negative indices find
     // nothing until it is ready.
-    const int64_t oldestIndex = getIndexForFrame(t, mFrames.front());
+    // The oldest frame's relative index as getIndexForFrame gives it, knowing that it is queued
+    // at position 0.
+    FrameItem& oldest = mFrames.front();
+    const bool oldestValid = oldest.pollValid();
+    int64_t oldestIndex = 0;
+    if (!oldestValid) {
+        ILOG(1, "FrameList passed an invalid FrameItem");
+    } else if (t < oldest.mID) {
+        oldestIndex = 1;
+    } else {
+        oldestIndex = -getPresentQueueIndex(t);
+    }
     int64_t position = int64_t{index} - oldestIndex;
     if (index > 0 && oldestIndex < 0) position -= 1;  // the gap at index 0
-    if (position < 0 || position >= static_cast<int64_t>(mFrames.size())) return FrameItem();
-    return mFrames[static_cast<size_t>(position)];
+    if (position < 0 || position >= static_cast<int64_t>(mFrames.size())) return nullptr;
+    FrameItem& found = mFrames[static_cast<size_t>(position)];
+    valid = position == 0 ? oldestValid : found.pollValid();
+    return &found;
+}
+
+FrameItem FrameList::getFrameAt(const nsecs_t& t, int index) {
+    bool valid;
+    const FrameItem* found = frameAtLocked(t, index, valid);
+    return found != nullptr ? *found : FrameItem();
 }
 
 FrameItem FrameList::getFrameBefore(const nsecs_t& t) {
@@ -147,6 +195,10 @@ FrameItem FrameList::getFrameAfter(const nsecs_t& t) {
     return getFrameAt(t, 1);
 }
 
+FrameList::Neighbours FrameList::getNeighbours(const nsecs_t& t) {
+    return NeighbourPick(*this, t).neighbours();
+}
+
 bool FrameList::isLockedLocked(nsecs_t id) const {
     return std::binary_search(mLocks.begin(), mLocks.end(), id);
 }
@@ -156,18 +208,42 @@ void FrameList::lockLocked(const FrameItem& frame) {
     if (position == mLocks.end() || *position != frame.mID) mLocks.insert(position, frame.mID);
 }
 
+FrameList::NeighbourPick::NeighbourPick(FrameList& list, nsecs_t t)
+    : mList(list), mLock(list.mMutex) {
+    mBefore = list.frameAtLocked(t, -1, mNeighbours.beforeValid);
+    mAfter = list.frameAtLocked(t, 1, mNeighbours.afterValid);
+    if (mBefore != nullptr) mNeighbours.beforeID = mBefore->mID;
+    if (mAfter != nullptr) mNeighbours.afterID = mAfter->mID;
+}
+
+FrameItem FrameList::NeighbourPick::lock(const FrameItem* frame, bool valid) {
+    // The queue cannot have changed since the look-up: only its lines are logged again.
+    if (mList.mFrames.empty()) {
+        ILOG(1, "FrameList is empty");
+        return FrameItem();
+    }
+    if (!mList.mFrames.front().isValid()) ILOG(1, "FrameList passed an invalid FrameItem");
+    if (frame == nullptr) return FrameItem();
+    if (mList.mLockingEnabled && valid) mList.lockLocked(*frame);
+    return *frame;
+}
+
 FrameItem FrameList::getFrameBeforeAndLock(const nsecs_t& t) {
     std::lock_guard lock(mMutex);
-    FrameItem frame = getFrameAt(t, -1);
-    if (mLockingEnabled && frame.isValid()) lockLocked(frame);
-    return frame;
+    return copyLockingIfValidLocked(t, -1);
 }
 
 FrameItem FrameList::getFrameAfterAndLock(const nsecs_t& t) {
     std::lock_guard lock(mMutex);
-    FrameItem frame = getFrameAt(t, 1);
-    if (mLockingEnabled && frame.isValid()) lockLocked(frame);
-    return frame;
+    return copyLockingIfValidLocked(t, 1);
+}
+
+FrameItem FrameList::copyLockingIfValidLocked(nsecs_t t, int index) {
+    bool valid;
+    const FrameItem* frame = frameAtLocked(t, index, valid);
+    if (frame == nullptr) return FrameItem();
+    if (mLockingEnabled && valid) lockLocked(*frame);
+    return *frame;
 }
 
 FrameItem FrameList::getFrameAtAndLock(const nsecs_t& t) {
@@ -182,7 +258,7 @@ FrameItem FrameList::getFrameAtAndLock(const nsecs_t& t) {
 FrameItem FrameList::getLatestValidFrameAndLock() {
     std::lock_guard lock(mMutex);
     for (size_t i = mFrames.size(); i-- > 0;) {
-        if (mFrames[i].isValid()) {
+        if (mFrames[i].pollValid()) {
             lockLocked(mFrames[i]);
             return mFrames[i];
         }
@@ -248,7 +324,8 @@ bool FrameList::isOldestFrameUnused(const nsecs_t& t) {
 }
 
 bool FrameList::isOldestFrameUnusedLocked(const nsecs_t& t) {
-    return getFrameAt(t, -2).isValid();
+    bool valid;
+    return frameAtLocked(t, -2, valid) != nullptr && valid;
 }
 
 void FrameList::waitWhileLockedLocked(nsecs_t id, std::unique_lock<std::mutex>& lock) {
@@ -259,6 +336,8 @@ void FrameList::waitWhileLockedLocked(nsecs_t id, std::unique_lock<std::mutex>& 
 
 FrameItem FrameList::clearOldestFrameLockedLocking(std::unique_lock<std::mutex>& lock) {
     if (mFrames.empty()) return FrameItem();
+    // Without a wait the front cannot change, and the frame taken out is the result itself.
+    if (!isLockedLocked(mFrames.front().mID)) return mFrames.pop_front();
     FrameItem oldest = mFrames.front();
     waitWhileLockedLocked(oldest.mID, lock);
     // Whatever is at the front now goes; another removal may have emptied the list meanwhile.
@@ -269,18 +348,14 @@ FrameItem FrameList::clearOldestFrameLockedLocking(std::unique_lock<std::mutex>&
 std::vector<FrameItem> FrameList::clearOldestFrameLocking() {
     Interpolation::ScopedTrace trace("clearOldestFrameLocking");
     UniqueLock<std::mutex> lock(mMutex);
-    FrameItem removed = clearOldestFrameLockedLocking(lock);
-    if (!removed.isValid()) return {};
-    return {std::move(removed)};
+    return validOnly(clearOldestFrameLockedLocking(lock));
 }
 
 std::vector<FrameItem> FrameList::clearOldestFrameIfUnusedLocking(const nsecs_t& t) {
     Interpolation::ScopedTrace trace("clearOldestFrameIfUnusedLocking");
     UniqueLock<std::mutex> lock(mMutex);
     if (!isOldestFrameUnusedLocked(t)) return {};
-    FrameItem removed = clearOldestFrameLockedLocking(lock);
-    if (!removed.isValid()) return {};
-    return {std::move(removed)};
+    return validOnly(clearOldestFrameLockedLocking(lock));
 }
 
 FrameItem FrameList::clearFrameAtLocking(const nsecs_t& t) {

@@ -70,10 +70,24 @@ public:
 
 private:
     using Subscription = std::pair<uint32_t /* flags */, wp<EventReceiver>>;
+    class CalledReceivers;
 
-    static EventDispatcher& getInstanceLocked();
+    static EventDispatcher& getInstanceLocked() {
+        if (mInstance == nullptr) mInstance.reset(new EventDispatcher());
+        return *mInstance;
+    }
+    // Delivers the event; `called` holds each receiver called, to be released after the mutex.
+    void deliverLocked(uint32_t uid, EventType type, nsecs_t time, const EventData& data,
+                       CalledReceivers& called);
+
+    // Removes the uid's entry, and forgets it as the last one broadcast to.
+    void eraseLocked(uint32_t uid);
 
     std::unordered_map<uint32_t, std::vector<Subscription>> mSubscriptions;  // by uid
+    // The entry of the uid broadcast to last: a layer's events come in runs, and finding the
+    // entry again would cost a division. Entries stay in place until erased.
+    uint32_t mLastUid = 0;
+    std::vector<Subscription>* mLastSubscriptions = nullptr;
 
     static std::unique_ptr<EventDispatcher> mInstance;  // guarded by mMutex
     static std::mutex mMutex;

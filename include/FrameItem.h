@@ -24,6 +24,10 @@ struct FrameItem {
     nsecs_t mTimestamp;  // sanitised queue timestamp; the frame's identity
     sp<Fence> mAcquireFence;
     bool mAcquired;
+    // mAcquireFence once it has been seen signalled: a fence that has signalled stays signalled,
+    // so it is not polled again. Tied to the fence object, so that a frame given another fence
+    // polls that one.
+    const Fence* mSignalledFence = nullptr;
 
     FrameItem();
     FrameItem(const FrameItem&) = default;
@@ -40,6 +44,17 @@ struct FrameItem {
     bool isReady() const;
     // A queued frame that can be composed: a desired display time, and ready.
     bool isValid() const { return mID != 0 && isReady(); }
+    // The same, remembering a signal it sees. Defined here so that the poll is made from the
+    // caller's own frame: after a system call each return above it is mispredicted.
+    bool pollReady() {
+        if (mAcquired || mAcquireFence == nullptr || mSignalledFence == mAcquireFence.get()) {
+            return true;
+        }
+        if (mAcquireFence->wait(0) != NO_ERROR) return false;
+        mSignalledFence = mAcquireFence.get();
+        return true;
+    }
+    bool pollValid() { return mID != 0 && pollReady(); }
 };
 
 namespace Interpolation {

@@ -10,6 +10,7 @@
 #include <mutex>
 
 #include "EventDispatcher.h"
+#include "FenceTimePool.h"
 #include "RingBuffer.h"
 
 namespace android::Interpolation {
@@ -73,6 +74,10 @@ public:
     // Finishes the slot's record: polls its fences, stamps it and moves it into the history.
     void releaseBufferTimings(const nsecs_t& t, const int& slot);
     void frameNumberForIndex(const uint64_t& frameNumber, const int& slot);
+    // A wrapper of `fence` for the stage records, from this aggregator's pool.
+    SharedPtrWrapper<FenceTime> wrapFence(const sp<Fence>& fence) const {
+        return mFenceTimes->wrap(fence);
+    }
 
     // Takes the signal times of the slot's fences that have signalled. Pending and invalid fences
     // stay attached, to be polled again.
@@ -97,6 +102,7 @@ private:
     RingBuffer<FrameTimings> mHistory;      // guarded by mMutex
     nsecs_t mLastRequestTime = -1;          // guarded by mMutex
     RingBuffer<int> mDequeueOrder;          // guarded by mMutex; slots, in order of dequeue
+    const sp<FenceTimePool> mFenceTimes;
 };
 
 }  // namespace android::Interpolation

@@ -36,7 +36,7 @@ protected:
 
     // A state with room for the two items a composition holds at most.
     static RenderState newState();
-    static void pushFrame(RenderState& state, const FrameItem& frame);
+    static void pushFrame(RenderState& state, FrameItem frame);
     // Broadcasts `kind` with the picked state and hands the state back.
     RenderState announce(EventType kind, RenderState&& state) const;
 

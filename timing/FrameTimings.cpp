@@ -18,7 +18,10 @@ bool hasSignalled(nsecs_t signalTime) {
 }  // namespace
 
 FrameTimingsAggregator::FrameTimingsAggregator(uint32_t uid)
-    : mUid(uid), mHistory(HISTORY_SIZE), mDequeueOrder(DEQUEUE_ORDER_SIZE) {}
+    : mUid(uid),
+      mHistory(HISTORY_SIZE),
+      mDequeueOrder(DEQUEUE_ORDER_SIZE),
+      mFenceTimes(new FenceTimePool()) {}
 
 void FrameTimingsAggregator::broadcast(EventType type, nsecs_t time, int slot) const {
     EventDispatcher::broadcastEvent(mUid, type, time, slot);

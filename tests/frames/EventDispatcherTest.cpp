@@ -126,6 +126,20 @@ TEST_F(EventDispatcherTest, subobjectsSharingAReferenceBlockAreDistinctReceivers
     EventDispatcher::unsubscribe(mUid, eFrameReceivedEvent, first);
 }
 
+TEST_F(EventDispatcherTest, aUidErasedAfterABroadcastIsFoundAnewWhenSubscribedAgain) {
+    sp<RecordingReceiver> first = new RecordingReceiver();
+    sp<RecordingReceiver> second = new RecordingReceiver();
+    EventDispatcher::subscribe(mUid, EventDispatcher::ALL_EVENTS, first);
+    broadcast(eFrameReceivedEvent);
+    EventDispatcher::unsubscribe(mUid, EventDispatcher::ALL_EVENTS, first);
+    broadcast(eFrameReceivedEvent);  // erases the emptied entry
+    EventDispatcher::subscribe(mUid, EventDispatcher::ALL_EVENTS, second);
+    broadcast(eFrameReleasedEvent);
+    EXPECT_THAT(first->types(), ElementsAre(1u));
+    EXPECT_THAT(second->types(), ElementsAre(2u));
+    EventDispatcher::unsubscribe(mUid, EventDispatcher::ALL_EVENTS, second);
+}
+
 // A receiver that unsubscribes when its last strong reference goes, as every component does.
 class SelfUnsubscribingReceiver : public EventDispatcher::EventReceiver {
 public:
@@ -152,6 +166,24 @@ TEST_F(EventDispatcherTest, receiverReleasedDuringABroadcastUnsubscribesAfterIt)
     broadcast(eFrameReceivedEvent);  // would deadlock if the reference were dropped under the lock
 
     EXPECT_EQ(nullptr, weak.promote());
+    LogCapture log(1);
+    broadcast(eFrameReceivedEvent);
+    EXPECT_TRUE(log.contains("EventDispatcher::broadcastEventLocked no subscribers for uid " +
+                             mUidText));
+}
+
+TEST_F(EventDispatcherTest, receiversBeyondTheOnesABroadcastKeepsAtHandAlsoUnsubscribeAfterIt) {
+    std::vector<sp<SelfUnsubscribingReceiver>> receivers(40);
+    for (sp<SelfUnsubscribingReceiver>& receiver : receivers) {
+        receiver = new SelfUnsubscribingReceiver(mUid, &receiver);
+        EventDispatcher::subscribe(mUid, EventDispatcher::ALL_EVENTS, receiver);
+    }
+    std::vector<wp<SelfUnsubscribingReceiver>> weak(receivers.begin(), receivers.end());
+
+    broadcast(eFrameReceivedEvent);
+
+    for (const wp<SelfUnsubscribingReceiver>& receiver : weak)
+        EXPECT_EQ(nullptr, receiver.promote());
     LogCapture log(1);
     broadcast(eFrameReceivedEvent);
     EXPECT_TRUE(log.contains("EventDispatcher::broadcastEventLocked no subscribers for uid " +

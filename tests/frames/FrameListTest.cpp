@@ -1,5 +1,6 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include <chrono>
 #include <future>
@@ -165,6 +166,67 @@ TEST_F(FrameListTest, emptyListLooksUpNothing) {
     EXPECT_EQ(0, mList->getPresentQueueIndex(10));
     EXPECT_EQ(-1, mList->getFrameIndexBeforeLocked(10));
     EXPECT_THAT(log.texts(), ElementsAre("FrameList is empty"));
+}
+
+// A fence that has signalled stays signalled, so the list polls it only until it has seen the
+// signal. Draining the host's eventfd makes a fence poll as pending again: frames the list has
+// seen signalled stay valid, in the queue and in the copies it hands out.
+TEST_F(FrameListTest, aSignalSeenIsRememberedAndAnotherFenceIsPolledAnew) {
+    const sp<Fence> fence = Fence::createPending();
+    mList->insertFrame(makeFrame(10, /*acquired=*/false, fence));
+    mList->insertFrame(makeFrame(20, /*acquired=*/false, fence));
+    EXPECT_FALSE(mList->getNeighbours(15).beforeValid);
+    fence->signal(5);
+    EXPECT_TRUE(mList->getFrameAfter(15).isValid());
+    uint64_t count;
+    ASSERT_EQ(static_cast<ssize_t>(sizeof(count)), read(fence->get(), &count, sizeof(count)));
+    ASSERT_FALSE(makeFrame(10, /*acquired=*/false, fence).isValid());
+
+    const FrameItem before = mList->getFrameBeforeAndLock(15);
+    EXPECT_TRUE(before.isValid());
+    const FrameList::Neighbours around = mList->getNeighbours(15);
+    EXPECT_TRUE(around.beforeValid && around.afterValid);
+    EXPECT_EQ(20, mList->getLatestValidFrameAndLock().mID);
+
+    // A copy merged in with another fence brings that fence's state instead.
+    mList->insertFrame(makeFrame(20, /*acquired=*/false, Fence::createPending()));
+    EXPECT_FALSE(mList->getNeighbours(15).afterValid);
+    FrameItem regiven = before;
+    regiven.mAcquireFence = Fence::createPending();
+    EXPECT_FALSE(regiven.isValid());
+}
+
+TEST_F(FrameListTest, neighboursAreWhatTheLookUpsBeforeAndAfterFindWithTheirLogLines) {
+    LogCapture log(1);
+    EXPECT_EQ(0, mList->getNeighbours(10).beforeID);
+    EXPECT_EQ(2, log.count("FrameList is empty"));
+    insert({10, 20});
+    for (bool oldestReady : {true, false}) {
+        if (!oldestReady) {
+            mList->insertFrame(makeFrame(5, /*acquired=*/false, Fence::createPending()));
+        }
+        for (nsecs_t t : {0, 5, 10, 15, 20, 25}) {
+            const FrameList::Neighbours around = mList->getNeighbours(t);
+            const FrameItem before = mList->getFrameBefore(t);
+            const FrameItem after = mList->getFrameAfter(t);
+            EXPECT_EQ(before.mID, around.beforeID) << t;
+            EXPECT_EQ(before.isValid(), around.beforeValid) << t;
+            EXPECT_EQ(after.mID, around.afterID) << t;
+            EXPECT_EQ(after.isValid(), around.afterValid) << t;
+        }
+    }
+    // From a pending oldest frame every look-up logs, and the neighbours count as two.
+    EXPECT_EQ(6 * 4, log.count("FrameList passed an invalid FrameItem"));
+
+    // A pick locks what the locking look-up would have, and logs as it would.
+    log.clear();
+    const FrameItem picked = FrameList::NeighbourPick(*mList, 15).lockAfter();
+    EXPECT_EQ(3, log.count("FrameList passed an invalid FrameItem"));
+    mList->unlock(picked.mID);
+    EXPECT_EQ(mList->getFrameAfterAndLock(15).mID, picked.mID);
+    EXPECT_EQ(4, log.count("FrameList passed an invalid FrameItem"));
+    EXPECT_EQ(10, picked.mID);
+    EXPECT_FALSE(log.contains("FrameList attempted to unlock non-locked frame 10"));
 }
 
 TEST_F(FrameListTest, lockingLookUpsChooseTheirFramesAndOnlyBeforeAndAfterStopAtKillLocks) {
