@@ -11,6 +11,7 @@
 #include <thread>
 #include <vector>
 
+#include "BenchSupport.h"
 #include "host/LayerHost.h"
 
 namespace android::Interpolation {
@@ -73,7 +74,7 @@ private:
             const int slot = static_cast<int>(number % BUFFERS);
             const nsecs_t queueTime = systemTime(SYSTEM_TIME_MONOTONIC);
             mHost.onBufferDequeued(slot, frameStart, queueTime);
-            const sp<Fence> fence = Fence::createPending();
+            const sp<Fence> fence = withDescriptor(Fence::createPending());
             mHost.onBufferQueued(number, slot, mBuffers[slot], queueTime, fence);
             sleepUntil(queueTime + RENDER_TIME);
             fence->signal(systemTime(SYSTEM_TIME_MONOTONIC));
@@ -138,7 +139,8 @@ void BM_HostCompositionCpuFloor(benchmark::State& state) {
     sp<NullReceiver> receiver = new NullReceiver();
     EventDispatcher::subscribe(uid, eBufferComposedEvent, receiver);
     std::mutex queueMutex;
-    const sp<Fence> fences[] = {Fence::createSignalled(0), Fence::createSignalled(0)};
+    const sp<Fence> fences[] = {withDescriptor(Fence::createSignalled(0)),
+                                withDescriptor(Fence::createSignalled(0))};
     const EventData composed = RenderState();
 
     std::vector<nsecs_t> samples;
@@ -204,7 +206,7 @@ void BM_JustInTimeReleaseLateness(benchmark::State& state) {
     uint64_t number = 0;
     const auto queueFrame = [&] {
         const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
-        const sp<Fence> fence = Fence::createSignalled(now);
+        const sp<Fence> fence = withDescriptor(Fence::createSignalled(now));
         number++;
         host.onBufferQueued(number, static_cast<int>(number % BUFFERS), buffer, now, fence);
         host.onBufferAcquired(number, static_cast<int>(number % BUFFERS), buffer, now, fence);

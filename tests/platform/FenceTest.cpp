@@ -1,9 +1,11 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <gui/InterpolationGui.h>
+#include <poll.h>
 #include <ui/Fence.h>
 #include <ui/FenceTime.h>
 #include <ui/GraphicBuffer.h>
+#include <unistd.h>
 
 namespace android {
 namespace {
@@ -26,6 +28,24 @@ TEST(FenceTest, signalsOnceAndClosesItsDescriptorWithTheLastReference) {
     EXPECT_NE(-1, fcntl(fd, F_GETFD));  // the FenceTime still holds the fence
     fenceTime.reset();
     EXPECT_EQ(-1, fcntl(fd, F_GETFD));
+}
+
+// The descriptor is made on demand, readable when the fence signalled before; from then on a wait
+// polls it, as on a device: a drained descriptor reads as not signalled.
+TEST(FenceTest, aDescriptorMadeLateIsReadableAndIsWhatWaitsPoll) {
+    sp<Fence> early = Fence::createSignalled(1);
+    pollfd readable{early->get(), POLLIN, 0};
+    EXPECT_EQ(1, poll(&readable, 1, 0));
+
+    sp<Fence> fence = Fence::createPending();
+    const int fd = fence->get();
+    EXPECT_EQ(TIMED_OUT, fence->wait(0));
+    fence->signal(5);
+    EXPECT_EQ(NO_ERROR, fence->wait(0));
+    uint64_t count = 0;
+    ASSERT_EQ(static_cast<ssize_t>(sizeof(count)), read(fd, &count, sizeof(count)));
+    EXPECT_EQ(TIMED_OUT, fence->wait(0));
+    EXPECT_EQ(5, fence->getSignalTime());
 }
 
 TEST(FenceTest, noFenceCountsAsSignalledButHasNoTime) {

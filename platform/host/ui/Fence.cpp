@@ -41,6 +41,7 @@ int Fence::descriptorLocked() const {
             ALOGE("Fence: eventfd failed (errno %d)", errno);
             return -1;
         }
+        mMadeFd.store(mFenceFd.get(), std::memory_order_release);
         // Signalled before anyone asked for the descriptor: readable from the start.
         if (mSignalTime.load(std::memory_order_acquire) != SIGNAL_TIME_PENDING) {
             const uint64_t one = 1;
@@ -53,11 +54,13 @@ int Fence::descriptorLocked() const {
 }
 
 status_t Fence::wait(int timeout) const {
-    if (!mValid || mSignalTime.load(std::memory_order_acquire) != SIGNAL_TIME_PENDING) {
-        return NO_ERROR;
+    if (!mValid) return NO_ERROR;
+    int fd = mMadeFd.load(std::memory_order_acquire);
+    if (fd < 0) {
+        if (mSignalTime.load(std::memory_order_acquire) != SIGNAL_TIME_PENDING) return NO_ERROR;
+        if (timeout == 0) return TIMED_OUT;
+        fd = get();
     }
-    if (timeout == 0) return TIMED_OUT;
-    const int fd = get();
     if (fd < 0) return TIMED_OUT;
     pollfd pfd{fd, POLLIN, 0};
     int ret;
