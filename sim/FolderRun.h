@@ -10,6 +10,7 @@
 #include "sim/Capture.h"
 #include "sim/Options.h"
 #include "sim/Result.h"
+#include "sim/Scenario.h"
 #include "sim/Simulation.h"
 #include "sim/Summary.h"
 
@@ -39,9 +40,11 @@ struct FolderRun {
 // several simulations in one process calls it once per run: each run starts from the library's
 // process-wide state as the first would (see Simulation), and in simulated time gives the same
 // files for the same inputs. With `progress`, it announces the run there, and reports how it goes.
+// A scenario (Scenario.h) plays its game, display, client-composition bursts and deliveries of
+// settings; its option defaults and first settings are already in `options` and `settings`.
 Result<FolderRun> runIntoFolder(const Options& options,
                                 const std::vector<host::SettingValue>& settings,
                                 const Capture* capture, const std::atomic<bool>& interrupted,
-                                std::ostream* progress);
+                                std::ostream* progress, const Scenario* scenario = nullptr);
 
 }  // namespace verolux::sim

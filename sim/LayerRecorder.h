@@ -14,7 +14,8 @@ namespace verolux::sim {
 // game's request for a buffer to the buffer's release, decides at every refresh what the screen
 // shows (and which frame leads the picture), and passes on the engine's display-delay changes.
 // Callers pass every time in; it may be called from several threads, and calls its sink with its
-// own mutex held, so the sink must not call back.
+// own mutex held, so the sink must not call back. It hears the engine announce each frame that
+// enters its queue, with the timestamp the engine gave it.
 class LayerRecorder : public android::Interpolation::EventDispatcher::EventReceiver {
 public:
     // Completed frames wait for the earlier ones at most this long before they are passed on out
@@ -36,7 +37,7 @@ public:
     // The game's side.
     void frameDequeued(uint64_t number, int slot, nsecs_t contentTime, nsecs_t startTime,
                        nsecs_t dequeueTime);
-    void frameQueued(uint64_t number, nsecs_t queueTime);
+    void frameQueued(uint64_t number, nsecs_t queueTime, nsecs_t timestamp);
     // The display's side.
     void frameAcquired(uint64_t number, nsecs_t acquireTime, nsecs_t renderDoneTime);
     // A refresh with its index, times and composed items (weights included): the recorder adds

@@ -10,9 +10,11 @@
 #include <string>
 
 #include "sim/Capture.h"
+#include "sim/Expectations.h"
 #include "sim/FolderRun.h"
 #include "sim/Options.h"
 #include "sim/Report.h"
+#include "sim/Scenario.h"
 #include "sim/SettingsKeys.h"
 
 namespace {
@@ -41,15 +43,25 @@ int fail(const std::string& errorLine) {
 }  // namespace
 
 int main(int argc, char** argv) {
-    const Result<Options> parsed = parseOptions(argc, argv);
+    Result<Options> parsed = parseOptions(argc, argv);
     if (!parsed.ok()) return fail(parsed.error);
-    const Options& options = parsed.value;
+    Options& options = parsed.value;
     if (options.help) {
         std::cout << usage();
         return 0;
     }
 
-    const Result<std::vector<verolux::host::SettingValue>> settings = gatherSettings(options);
+    std::optional<Scenario> scenario;
+    if (!options.scenario.empty()) {
+        Result<Scenario> read = readScenario(options.scenario);
+        if (!read.ok()) return fail(read.error);
+        scenario = std::move(read.value);
+        if (const Status applied = applyScenario(*scenario, options); !applied.ok()) {
+            return fail(applied.error);
+        }
+    }
+    const Result<std::vector<verolux::host::SettingValue>> settings = gatherSettings(
+            options, scenario ? scenario->settings : std::vector<verolux::host::SettingValue>{});
     if (!settings.ok()) return fail(settings.error);
 
     std::optional<Capture> capture;
@@ -62,7 +74,7 @@ int main(int argc, char** argv) {
     installInterruptHandler();
     const Result<FolderRun> ran =
             runIntoFolder(options, settings.value, capture ? &*capture : nullptr, sInterrupted,
-                          options.quiet ? nullptr : &std::cerr);
+                          options.quiet ? nullptr : &std::cerr, scenario ? &*scenario : nullptr);
     if (!ran.ok()) return fail(ran.error);
     const FolderRun& run = ran.value;
     int status = run.result.interrupted ? 130 : 0;
@@ -78,10 +90,20 @@ int main(int argc, char** argv) {
         std::cout << "Interrupted: results cover the run so far.\n";
     }
     if (!options.quiet) std::cout << run.summaryText << std::flush;
+    if (scenario && !scenario->expectations.empty()) {
+        if (!options.quiet) std::cout << "Expectations of scenario " << scenario->name << ":\n";
+        for (const CheckedExpectation& checked : checkExpectations(*scenario, run.run())) {
+            if (!options.quiet || !checked.passed) std::cout << "  " << checked.line << "\n";
+            if (!checked.passed) status = status == 0 ? 1 : status;
+        }
+        std::cout << std::flush;
+    }
 
-    if (!options.quiet) std::cerr << "verolux-sim: drawing the figures..." << std::endl;
-    const Status drawn = drawFigures(options.outDir);
-    if (!drawn.ok()) std::cerr << drawn.error << std::endl;
+    if (options.figures) {
+        if (!options.quiet) std::cerr << "verolux-sim: drawing the figures..." << std::endl;
+        const Status drawn = drawFigures(options.outDir);
+        if (!drawn.ok()) std::cerr << drawn.error << std::endl;
+    }
     check(writeReport(options.outDir, run.described, run.run(), run.reference()));
 
     if (options.quiet) return status;
