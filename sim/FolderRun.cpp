@@ -216,6 +216,12 @@ Result<FolderRun> runIntoFolder(const Options& options,
     const std::vector<Summary> copies(run.summaries.begin() + (options.reference ? 2 : 1),
                                       run.summaries.end());
     run.summaryText = formatSummary(run.run(), run.reference()) + formatCopies(copies);
+    if (scenario != nullptr && !scenario->expectations.empty()) {
+        run.expectations = checkExpectations(*scenario, run.run());
+        run.summaryText += "Expectations of scenario " + scenario->name + ":\n";
+        for (const CheckedExpectation& checked : run.expectations)
+            run.summaryText += "  " + checked.line + "\n";
+    }
     writeFile(out / "summary.txt", run.summaryText.data(), run.summaryText.size(), run.errors);
     run.engineLogLines = engineLog.lines();
     return result;

@@ -8,6 +8,7 @@
 
 #include "host/SettingsMessage.h"
 #include "sim/Capture.h"
+#include "sim/Expectations.h"
 #include "sim/Options.h"
 #include "sim/Result.h"
 #include "sim/Scenario.h"
@@ -24,7 +25,9 @@ struct FolderRun {
     // One per layer: the run, the reference unless left out, then the copies.
     std::vector<Summary> summaries;
     bool hasReference = false;
-    std::string summaryText;  // as summary.txt holds it
+    // A scenario's expectations checked against the run's layer.
+    std::vector<CheckedExpectation> expectations;
+    std::string summaryText;  // as summary.txt holds it, the expectations last
     uint64_t engineLogLines = 0;
     // The files that could not be written, one error line each; the run itself is complete.
     std::vector<std::string> errors;

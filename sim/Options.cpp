@@ -376,6 +376,15 @@ Run and output:
   --picture-at S     start of the space-time picture's 2 s window (default 1)
   --no-reference     skip the mode-2 run on the same game
   --no-figures       draw no figures (matplotlib takes seconds); the report shows the tables
+Several runs of the same game, each into a subfolder of --out, then one table and one report:
+  --compare M,M,...  one run per mode (e.g. 0,2,3,5), side by side
+  --sweep KEY=V,V,...
+                     one run per value of a settings key; a second --sweep makes a grid of
+                     two keys (e.g. --sweep delayMs=32,48,64 --sweep hitTarget=0.95,0.99)
+  --latency-budget-ms MS
+                     mark the sweep's cells with the lowest animation error p95 whose
+                     latency p50 stays within MS (without it: the lowest overall)
+Others:
   --quiet            print nothing but errors
   --help             print this and exit
 

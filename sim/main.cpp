@@ -10,12 +10,14 @@
 #include <string>
 
 #include "sim/Capture.h"
+#include "sim/Comparison.h"
 #include "sim/Expectations.h"
 #include "sim/FolderRun.h"
 #include "sim/Options.h"
 #include "sim/Report.h"
 #include "sim/Scenario.h"
 #include "sim/SettingsKeys.h"
+#include "sim/Sweep.h"
 
 namespace {
 
@@ -72,9 +74,16 @@ int main(int argc, char** argv) {
     }
 
     installInterruptHandler();
-    const Result<FolderRun> ran =
-            runIntoFolder(options, settings.value, capture ? &*capture : nullptr, sInterrupted,
-                          options.quiet ? nullptr : &std::cerr, scenario ? &*scenario : nullptr);
+    const Capture* game = capture ? &*capture : nullptr;
+    const Scenario* played = scenario ? &*scenario : nullptr;
+    if (!options.compare.empty()) {
+        return compareModes(options, settings.value, game, played, sInterrupted);
+    }
+    if (!options.sweep.empty()) {
+        return sweepSettings(options, settings.value, game, played, sInterrupted);
+    }
+    const Result<FolderRun> ran = runIntoFolder(options, settings.value, game, sInterrupted,
+                                                options.quiet ? nullptr : &std::cerr, played);
     if (!ran.ok()) return fail(ran.error);
     const FolderRun& run = ran.value;
     int status = run.result.interrupted ? 130 : 0;
@@ -90,13 +99,10 @@ int main(int argc, char** argv) {
         std::cout << "Interrupted: results cover the run so far.\n";
     }
     if (!options.quiet) std::cout << run.summaryText << std::flush;
-    if (scenario && !scenario->expectations.empty()) {
-        if (!options.quiet) std::cout << "Expectations of scenario " << scenario->name << ":\n";
-        for (const CheckedExpectation& checked : checkExpectations(*scenario, run.run())) {
-            if (!options.quiet || !checked.passed) std::cout << "  " << checked.line << "\n";
-            if (!checked.passed) status = status == 0 ? 1 : status;
-        }
-        std::cout << std::flush;
+    for (const CheckedExpectation& checked : run.expectations) {
+        if (checked.passed) continue;
+        if (options.quiet) std::cout << checked.line << "\n";
+        status = status == 0 ? 1 : status;
     }
 
     if (options.figures) {
@@ -104,7 +110,10 @@ int main(int argc, char** argv) {
         const Status drawn = drawFigures(options.outDir);
         if (!drawn.ok()) std::cerr << drawn.error << std::endl;
     }
-    check(writeReport(options.outDir, run.described, run.run(), run.reference()));
+    ReportPage page = runPage(run.described, run.run(), run.reference());
+    for (const CheckedExpectation& checked : run.expectations)
+        page.expectations.push_back(checked.line);
+    check(writeReport(options.outDir, page));
 
     if (options.quiet) return status;
     rusage usage{};
