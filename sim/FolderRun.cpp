@@ -133,6 +133,36 @@ void writeFile(const std::filesystem::path& path, const char* bytes, size_t size
 
 }  // namespace
 
+Summary summarizeLayer(const Options& options, const Simulation& simulation,
+                       const RunResult& result, size_t layer, const MeasuredLayer& measured,
+                       const Capture* capture, const Scenario* scenario) {
+    const LayerPlan& plan = simulation.layers()[layer];
+    LayerFacts facts;
+    facts.role = plan.role;
+    facts.mode = plan.mode;
+    facts.time = options.time;
+    facts.runSec = (result.endTime - simulation.startTime()) / 1e9;
+    facts.buffers = plan.buffers.count;
+    facts.buffersFixed = plan.buffers.fixed;
+    facts.bufferBytes =
+            uint64_t{plan.buffers.count} * options.gameWidth * options.gameHeight * BYTES_PER_PIXEL;
+    facts.resolution = std::to_string(options.gameWidth) + "x" + std::to_string(options.gameHeight);
+    facts.ownFps = options.fps;
+    if (capture != nullptr) facts.ownFps = capture->fpsOverFirst(measured.framesQueued);
+    if (scenario != nullptr) {
+        facts.ownFps = GameScript(options.fps, options.jitterMs, options.renderMs, &scenario->game)
+                               .meanFps(facts.runSec);
+    }
+    facts.refreshHz = result.displayHz;
+    if (scenario != nullptr) {
+        for (const DisplayChange& change : scenario->display)
+            facts.refreshRateChanged |= change.at < facts.runSec && change.hz != options.hz;
+    }
+    facts.startTime = simulation.startTime();
+    facts.captureEnded = result.captureEnded;
+    return {facts, measured};
+}
+
 Result<FolderRun> runIntoFolder(const Options& options,
                                 const std::vector<host::SettingValue>& settings,
                                 const Capture* capture, const std::atomic<bool>& interrupted,
@@ -187,30 +217,8 @@ Result<FolderRun> runIntoFolder(const Options& options,
               run.result.ringLogs.size(), run.errors);
 
     for (size_t i = 0; i < simulation.layers().size(); i++) {
-        const LayerPlan& plan = simulation.layers()[i];
-        LayerFacts facts;
-        facts.role = plan.role;
-        facts.mode = plan.mode;
-        facts.time = options.time;
-        facts.runSec = (run.result.endTime - simulation.startTime()) / 1e9;
-        facts.buffers = plan.buffers.count;
-        facts.buffersFixed = plan.buffers.fixed;
-        facts.bufferBytes = uint64_t{plan.buffers.count} * options.gameWidth * options.gameHeight *
-                            BYTES_PER_PIXEL;
-        facts.resolution =
-                std::to_string(options.gameWidth) + "x" + std::to_string(options.gameHeight);
-        const MeasuredLayer measured = outputs.measures(i).result();
-        facts.ownFps = options.fps;
-        if (capture != nullptr) facts.ownFps = capture->fpsOverFirst(measured.framesQueued);
-        if (scenario != nullptr) {
-            facts.ownFps =
-                    GameScript(options.fps, options.jitterMs, options.renderMs, &scenario->game)
-                            .meanFps(facts.runSec);
-        }
-        facts.refreshHz = run.result.displayHz;
-        facts.startTime = simulation.startTime();
-        facts.captureEnded = run.result.captureEnded;
-        run.summaries.push_back({facts, measured});
+        run.summaries.push_back(summarizeLayer(options, simulation, run.result, i,
+                                               outputs.measures(i).result(), capture, scenario));
     }
     run.hasReference = options.reference;
     const std::vector<Summary> copies(run.summaries.begin() + (options.reference ? 2 : 1),

@@ -36,6 +36,11 @@ struct FolderRun {
     const Summary* reference() const { return hasReference ? &summaries[1] : nullptr; }
 };
 
+// The summary of one layer of a finished run: its measures and what the run knew of it besides.
+Summary summarizeLayer(const Options& options, const Simulation& simulation,
+                       const RunResult& result, size_t layer, const MeasuredLayer& measured,
+                       const Capture* capture, const Scenario* scenario);
+
 // Runs one simulation (Simulation) into options.outDir and writes every file there except the
 // figures and the report (drawFigures and writeReport draw them from these): run.json,
 // engine.log, the record files, dumpsys.txt, ringlog.bin and summary.txt. Fails, with a one-line

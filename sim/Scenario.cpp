@@ -42,6 +42,11 @@ std::string known(std::initializer_list<std::string_view> keys) {
     return text;
 }
 
+// "game[0].fps", or "description" at the top.
+std::string member(const std::string& where, const char* key) {
+    return where.empty() ? key : where + "." + key;
+}
+
 std::string formatValue(double value) {
     char text[32];
     snprintf(text, sizeof(text), "%g", value);
@@ -98,7 +103,7 @@ public:
                                  const std::string& where, double min, double max,
                                  bool required = false) {
         const Json::Value& value = object[key];
-        const std::string at = where + "." + key;
+        const std::string at = member(where, key);
         if (value.isNull()) {
             if (required) fail(where, "needs " + std::string(key));
             return std::nullopt;
@@ -125,7 +130,7 @@ public:
         const Json::Value& value = object[key];
         if (value.isNull()) return {};
         if (!value.isString()) {
-            fail(where + "." + key, "expects a text (got " + describeJson(value) + ")");
+            fail(member(where, key), "expects a text (got " + describeJson(value) + ")");
             return {};
         }
         return value.asString();

@@ -304,6 +304,22 @@ void warnings(const Summary& s, std::vector<std::string>& out) {
     }
 }
 
+// Notes on the run as a whole, which its layers share.
+void runNotes(const Summary& s, std::vector<std::string>& out) {
+    if (s.facts.captureEnded) {
+        out.push_back(
+                format("Note: the run stopped at the end of its capture, after %.2f s "
+                       "(--loop replays it).",
+                       s.facts.runSec));
+    }
+    if (s.facts.refreshRateChanged) {
+        out.push_back(
+                "Note: the display changed its refresh rate during the run: stutters are gaps "
+                "over 1.5 x the median gap of the whole run, so a stretch at a slower rate "
+                "counts its gaps as stutters.");
+    }
+}
+
 }  // namespace
 
 const char* modeName(uint32_t mode) {
@@ -397,12 +413,7 @@ std::vector<std::string> findings(const Summary& run, const Summary* reference) 
     }
     warnings(run, out);
     if (reference != nullptr) warnings(*reference, out);
-    if (run.facts.captureEnded) {
-        out.push_back(
-                format("Note: the run stopped at the end of its capture, after %.2f s "
-                       "(--loop replays it).",
-                       run.facts.runSec));
-    }
+    runNotes(run, out);
     return out;
 }
 

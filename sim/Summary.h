@@ -24,6 +24,7 @@ struct LayerFacts {
     double refreshHz = 0;                 // the display's true refresh rate
     nsecs_t startTime = 0;                // stutter times count from here
     bool captureEnded = false;            // the run stopped because its capture ran out
+    bool refreshRateChanged = false;      // the display changed its rate during the run
     TimeMode time = TimeMode::SIMULATED;  // how the run kept time
 };
 
