@@ -191,6 +191,11 @@ const Line LINES[] = {
              return number(s.facts.ownFps, "%.1f") + " fps" + (throttled(s) ? " (held back)" : "");
          }},
         {"game-rate limit first / last / lowest", gameRateLimit},
+        {"frame timestamps",
+         [](const Summary& s) -> std::string {
+             const auto& from = s.measured.clockTimeFrom;
+             return from ? "the engine's clock from " + seconds(s, *from) : "the game's";
+         }},
         {"waited for a free buffer",
          [](const Summary& s) {
              return format("%.0f ms (%.1f %% of the run)", s.measured.bufferWaitMs,
