@@ -62,15 +62,8 @@ int compareModes(const Options& options, const std::vector<host::SettingValue>& 
     }
     Result<GridRuns> ran =
             runGrid(cells, capture, scenario, interrupted, options.quiet ? nullptr : &std::cerr);
-    if (!ran.ok()) {
-        std::cerr << ran.error << std::endl;
-        return 2;
-    }
+    if (const int failed = gridFailure(ran)) return failed;
     GridRuns& grid = ran.value;
-    if (grid.runs.empty()) {
-        std::cerr << "verolux-sim: interrupted before the first run" << std::endl;
-        return 130;
-    }
     const std::vector<SummaryColumn> columns = grid.columns();
     const Summary* baseline = nullptr;
     for (size_t i = 0; i < grid.runs.size(); i++) {

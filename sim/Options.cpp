@@ -118,21 +118,9 @@ std::string applySeed(std::string_view text, Options& options) {
     return {};
 }
 
-// The comma-separated items of a list option's value.
-std::vector<std::string_view> items(std::string_view text) {
-    std::vector<std::string_view> out;
-    size_t start = 0;
-    while (true) {
-        const size_t comma = text.find(',', start);
-        out.push_back(trim(text.substr(start, comma - start)));
-        if (comma == std::string_view::npos) return out;
-        start = comma + 1;
-    }
-}
-
 std::string applyCompare(std::string_view text, Options& options) {
     options.compare.clear();
-    for (std::string_view item : items(text)) {
+    for (std::string_view item : splitAtCommas(text)) {
         const auto mode = parseInteger(item);
         if (!mode || *mode < 0 || *mode > 5) {
             return errorLine("--compare expects modes from 0 to 5, separated by commas (got " +
@@ -167,7 +155,7 @@ std::string applySweep(std::string_view text, Options& options) {
     }
     SweepAxis axis;
     axis.key = key;
-    for (std::string_view item : items(text.substr(equals + 1))) {
+    for (std::string_view item : splitAtCommas(text.substr(equals + 1))) {
         Result<host::SettingValue> value = parseSettingAssignment(key + "=" + std::string(item));
         if (!value.ok())
             return errorLine("--sweep" + value.error.substr(errorLine("--set").size()));

@@ -40,6 +40,16 @@ Result<GridRuns> runGrid(const std::vector<GridCell>& cells, const Capture* capt
     return result;
 }
 
+int gridFailure(const Result<GridRuns>& ran) {
+    if (!ran.ok()) {
+        std::cerr << ran.error << std::endl;
+        return 2;
+    }
+    if (!ran.value.runs.empty()) return 0;
+    std::cerr << "verolux-sim: interrupted before the first run finished" << std::endl;
+    return 130;
+}
+
 std::vector<std::pair<std::string, std::string>> gridOptions(
         const GridRuns& grid, const std::vector<host::SettingValue>& settings) {
     std::vector<std::pair<std::string, std::string>> out;

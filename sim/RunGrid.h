@@ -41,6 +41,10 @@ Result<GridRuns> runGrid(const std::vector<GridCell>& cells, const Capture* capt
                          const Scenario* scenario, const std::atomic<bool>& interrupted,
                          std::ostream* progress);
 
+// 0 when the grid has runs to report on; else prints why there are none and returns the exit
+// status: 2 when a cell's folder could not be opened, 130 when interrupted before a run finished.
+int gridFailure(const Result<GridRuns>& ran);
+
 // The options of the grid's first run as the report lists them, less what differs from cell to
 // cell (the buffers) and with the settings every cell shares.
 std::vector<std::pair<std::string, std::string>> gridOptions(

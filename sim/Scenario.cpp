@@ -181,85 +181,87 @@ public:
         out = std::move(read.value);
     }
 
-    void game(const Json::Value& object, Scenario& out) {
-        const Json::Value& segments = list(object, "game");
-        for (Json::ArrayIndex i = 0; i < segments.size() && !failed(); i++) {
-            const Json::Value& item = segments[i];
-            const std::string where = "game[" + std::to_string(i) + "]";
-            if (!onlyKeys(item, where,
-                          {"from", "until", "fps", "rampTo", "rampSec", "jitterMs", "renderMs",
-                           "spikeEverySec", "spikeRenderMs", "reuseTimestampEvery"})) {
-                return;
-            }
-            GameSegment& segment = out.game.emplace_back();
-            segment.from = time(item, "from", where, false).value_or(0);
-            segment.until = time(item, "until", where, false);
-            segment.fps = number(item, "fps", where, 0.1, 1000);
-            segment.rampTo = number(item, "rampTo", where, 0.1, 1000);
-            segment.rampSec = number(item, "rampSec", where, 0.001, LONGEST_RUN_SEC);
-            segment.jitterMs = number(item, "jitterMs", where, 0, 1000);
-            segment.renderMs = number(item, "renderMs", where, 0, 1000);
-            segment.spikeEverySec = number(item, "spikeEverySec", where, 0.001, LONGEST_RUN_SEC);
-            segment.spikeRenderMs = number(item, "spikeRenderMs", where, 0, 1000);
-            if (const auto every = number(item, "reuseTimestampEvery", where, 2, 1e6)) {
-                if (std::floor(*every) != *every) {
-                    fail(where + ".reuseTimestampEvery",
-                         "expects a whole number (got " + formatValue(*every) + ")");
-                }
-                segment.reuseTimestampEvery = static_cast<uint32_t>(*every);
-            }
-            if (failed()) return;
-            if (segment.until && *segment.until <= segment.from) {
-                fail(where, "until must be after from");
-            } else if (segment.rampTo.has_value() != segment.rampSec.has_value() ||
-                       (segment.rampTo && !segment.fps)) {
-                fail(where, "a sawtooth needs fps, rampTo and rampSec together");
-            } else if (segment.spikeEverySec.has_value() != segment.spikeRenderMs.has_value()) {
-                fail(where, "spikes need spikeEverySec and spikeRenderMs together");
-            }
+    // Reads each entry of the list under `key` with `read(entry, where)`, after checking that it
+    // is an object of `keys`; stops at the first problem.
+    template <typename Read>
+    void each(const Json::Value& object, const char* key,
+              std::initializer_list<std::string_view> keys, Read read) {
+        const Json::Value& entries = list(object, key);
+        for (Json::ArrayIndex i = 0; i < entries.size() && !failed(); i++) {
+            const std::string where = std::string(key) + "[" + std::to_string(i) + "]";
+            if (onlyKeys(entries[i], where, keys)) read(entries[i], where);
         }
+    }
+
+    void game(const Json::Value& object, Scenario& out) {
+        each(object, "game",
+             {"from", "until", "fps", "rampTo", "rampSec", "jitterMs", "renderMs", "spikeEverySec",
+              "spikeRenderMs", "reuseTimestampEvery"},
+             [&](const Json::Value& item, const std::string& where) {
+                 GameSegment& segment = out.game.emplace_back();
+                 segment.from = time(item, "from", where, false).value_or(0);
+                 segment.until = time(item, "until", where, false);
+                 segment.fps = number(item, "fps", where, 0.1, 1000);
+                 segment.rampTo = number(item, "rampTo", where, 0.1, 1000);
+                 segment.rampSec = number(item, "rampSec", where, 0.001, LONGEST_RUN_SEC);
+                 segment.jitterMs = number(item, "jitterMs", where, 0, 1000);
+                 segment.renderMs = number(item, "renderMs", where, 0, 1000);
+                 segment.spikeEverySec =
+                         number(item, "spikeEverySec", where, 0.001, LONGEST_RUN_SEC);
+                 segment.spikeRenderMs = number(item, "spikeRenderMs", where, 0, 1000);
+                 if (const auto every = number(item, "reuseTimestampEvery", where, 2, 1e6)) {
+                     if (std::floor(*every) != *every) {
+                         fail(where + ".reuseTimestampEvery",
+                              "expects a whole number (got " + formatValue(*every) + ")");
+                     }
+                     segment.reuseTimestampEvery = static_cast<uint32_t>(*every);
+                 }
+                 if (failed()) return;
+                 if (segment.until && *segment.until <= segment.from) {
+                     fail(where, "until must be after from");
+                 } else if (segment.rampTo.has_value() != segment.rampSec.has_value() ||
+                            (segment.rampTo && !segment.fps)) {
+                     fail(where, "a sawtooth needs fps, rampTo and rampSec together");
+                 } else if (segment.spikeEverySec.has_value() != segment.spikeRenderMs.has_value()) {
+                     fail(where, "spikes need spikeEverySec and spikeRenderMs together");
+                 }
+             });
     }
 
     void display(const Json::Value& object, Scenario& out) {
-        const Json::Value& changes = list(object, "display");
-        for (Json::ArrayIndex i = 0; i < changes.size() && !failed(); i++) {
-            const std::string where = "display[" + std::to_string(i) + "]";
-            if (!onlyKeys(changes[i], where, {"at", "hz"})) return;
-            DisplayChange change;
-            change.at = time(changes[i], "at", where, true).value_or(0);
-            change.hz = number(changes[i], "hz", where, 1, 1000, true).value_or(60);
-            out.display.push_back(change);
-        }
+        each(object, "display", {"at", "hz"},
+             [&](const Json::Value& item, const std::string& where) {
+                 const auto at = time(item, "at", where, true);
+                 const auto hz = number(item, "hz", where, 1, 1000, true);
+                 if (at && hz) out.display.push_back({*at, *hz});
+             });
     }
 
     void clientComposition(const Json::Value& object, Scenario& out) {
-        const Json::Value& bursts = list(object, "clientComposition");
-        for (Json::ArrayIndex i = 0; i < bursts.size() && !failed(); i++) {
-            const std::string where = "clientComposition[" + std::to_string(i) + "]";
-            if (!onlyKeys(bursts[i], where, {"from", "until", "share"})) return;
-            ClientCompositionBurst burst;
-            burst.from = time(bursts[i], "from", where, true).value_or(0);
-            burst.until = time(bursts[i], "until", where, true).value_or(0);
-            burst.share = number(bursts[i], "share", where, 0, 1).value_or(1);
-            if (!failed() && burst.until <= burst.from) fail(where, "until must be after from");
-            out.clientComposition.push_back(burst);
-        }
+        each(object, "clientComposition", {"from", "until", "share"},
+             [&](const Json::Value& item, const std::string& where) {
+                 ClientCompositionBurst burst;
+                 burst.from = time(item, "from", where, true).value_or(0);
+                 burst.until = time(item, "until", where, true).value_or(0);
+                 burst.share = number(item, "share", where, 0, 1).value_or(1);
+                 if (!failed() && burst.until <= burst.from)
+                     fail(where, "until must be after from");
+                 out.clientComposition.push_back(burst);
+             });
     }
 
     void deliveries(const Json::Value& object, Scenario& out) {
-        const Json::Value& deliveries = list(object, "deliveries");
-        for (Json::ArrayIndex i = 0; i < deliveries.size() && !failed(); i++) {
-            const std::string where = "deliveries[" + std::to_string(i) + "]";
-            if (!onlyKeys(deliveries[i], where, {"at", "settings"})) return;
-            SettingsDelivery delivery;
-            delivery.at = time(deliveries[i], "at", where, true).value_or(0);
-            if (deliveries[i]["settings"].isNull()) {
-                fail(where, "needs settings");
-                return;
-            }
-            settings(deliveries[i]["settings"], where + ".settings", delivery.settings);
-            out.deliveries.push_back(std::move(delivery));
-        }
+        each(object, "deliveries", {"at", "settings"},
+             [&](const Json::Value& item, const std::string& where) {
+                 SettingsDelivery delivery;
+                 delivery.at = time(item, "at", where, true).value_or(0);
+                 if (item["settings"].isNull()) {
+                     fail(where, "needs settings");
+                     return;
+                 }
+                 settings(item["settings"], where + ".settings", delivery.settings);
+                 out.deliveries.push_back(std::move(delivery));
+             });
     }
 
     // A bound: a number, or true or false for a measure that is a yes or a no.
@@ -269,41 +271,39 @@ public:
         if (value.isNull()) return std::nullopt;
         if (measure.yesNo) {
             if (value.isBool() && std::string_view(key) == "equals") return value.asBool() ? 1 : 0;
-            fail(where + "." + key, std::string(measure.name) +
-                                            " is a yes or a no: expect it with equals true or "
-                                            "false (got " +
-                                            describeJson(value) + ")");
+            fail(member(where, key), std::string(measure.name) +
+                                             " is a yes or a no: expect it with equals true or "
+                                             "false (got " +
+                                             describeJson(value) + ")");
             return std::nullopt;
         }
         return number(item, key, where, -1e12, 1e12);
     }
 
     void expectations(const Json::Value& object, Scenario& out) {
-        const Json::Value& list = this->list(object, "expect");
-        for (Json::ArrayIndex i = 0; i < list.size() && !failed(); i++) {
-            const Json::Value& item = list[i];
-            const std::string where = "expect[" + std::to_string(i) + "]";
-            if (!onlyKeys(item, where, {"that", "measure", "equals", "atLeast", "atMost"})) return;
-            Expectation expectation;
-            expectation.that = text(item, "that", where);
-            expectation.measure = text(item, "measure", where);
-            const NamedMeasure* measure = findMeasure(expectation.measure);
-            if (failed()) return;
-            if (measure == nullptr) {
-                fail(where + ".measure", "no measure named " + sim::quoted(expectation.measure) +
-                                                 " (see sim/scenarios/README.md)");
-                return;
-            }
-            expectation.equals = bound(item, "equals", where, *measure);
-            expectation.atLeast = bound(item, "atLeast", where, *measure);
-            expectation.atMost = bound(item, "atMost", where, *measure);
-            if (failed()) return;
-            if (!expectation.equals && !expectation.atLeast && !expectation.atMost) {
-                fail(where, "needs equals, atLeast or atMost");
-                return;
-            }
-            out.expectations.push_back(std::move(expectation));
-        }
+        each(object, "expect", {"that", "measure", "equals", "atLeast", "atMost"},
+             [&](const Json::Value& item, const std::string& where) {
+                 Expectation expectation;
+                 expectation.that = text(item, "that", where);
+                 expectation.measure = text(item, "measure", where);
+                 const NamedMeasure* measure = findMeasure(expectation.measure);
+                 if (failed()) return;
+                 if (measure == nullptr) {
+                     fail(where + ".measure", "no measure named " +
+                                                      sim::quoted(expectation.measure) +
+                                                      " (see sim/scenarios/README.md)");
+                     return;
+                 }
+                 expectation.equals = bound(item, "equals", where, *measure);
+                 expectation.atLeast = bound(item, "atLeast", where, *measure);
+                 expectation.atMost = bound(item, "atMost", where, *measure);
+                 if (failed()) return;
+                 if (!expectation.equals && !expectation.atLeast && !expectation.atMost) {
+                     fail(where, "needs equals, atLeast or atMost");
+                     return;
+                 }
+                 out.expectations.push_back(std::move(expectation));
+             });
     }
 
 private:

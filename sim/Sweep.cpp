@@ -140,15 +140,8 @@ int sweepSettings(const Options& options, const std::vector<host::SettingValue>&
     }
     Result<GridRuns> ran =
             runGrid(cells, capture, scenario, interrupted, options.quiet ? nullptr : &std::cerr);
-    if (!ran.ok()) {
-        std::cerr << ran.error << std::endl;
-        return 2;
-    }
+    if (const int failed = gridFailure(ran)) return failed;
     GridRuns& runs = ran.value;
-    if (runs.runs.empty()) {
-        std::cerr << "verolux-sim: interrupted before the first run" << std::endl;
-        return 130;
-    }
     const std::vector<SummaryColumn> columns = runs.columns();
     const std::vector<bool> best = bestCells(columns, options.latencyBudgetMs);
 
