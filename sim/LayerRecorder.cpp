@@ -50,15 +50,17 @@ void LayerRecorder::onEvent(const EventType& type, const nsecs_t& time, const Ev
     const auto* delay = std::get_if<nsecs_t>(&data);
     if (type != eDelayChangedEvent || delay == nullptr) return;
     mDelay = *delay;
+    if (!mStarted) return;
     std::lock_guard lock(mMutex);
     mSink.onDelayChange(time, *delay);
 }
 
 void LayerRecorder::start(nsecs_t startTime, nsecs_t initialDelay) {
-    if (initialDelay < 0) return;
-    mDelay = initialDelay;
+    mStarted = true;
+    if (mDelay < 0) mDelay = initialDelay;
+    if (mDelay < 0) return;
     std::lock_guard lock(mMutex);
-    mSink.onDelayChange(startTime, initialDelay);
+    mSink.onDelayChange(startTime, mDelay);
 }
 
 void LayerRecorder::finish() {

@@ -29,7 +29,8 @@ public:
     void onEvent(const android::Interpolation::EventType& type, const nsecs_t& time,
                  const android::Interpolation::EventData& data) override;
 
-    // The delay frames get from the start, when the engine applies one (-1: none).
+    // The delay frames get from the start: the last the engine announced before it, or else
+    // `initialDelay` when the engine applies one (-1: none).
     void start(nsecs_t startTime, nsecs_t initialDelay);
     // Passes on the frames still in flight.
     void finish();
@@ -76,6 +77,7 @@ private:
     std::atomic<size_t> mFrameCount{0};
     std::atomic<size_t> mRefreshCount{0};
     std::atomic<nsecs_t> mDelay{-1};
+    std::atomic<bool> mStarted{false};  // delay changes before the start set the first delay
     std::mutex mMutex;
     RecordSink& mSink;                         // called under mMutex
     std::vector<FrameRecord> mInFlight;        // guarded by mMutex; dequeued and not yet released

@@ -216,8 +216,9 @@ private:
     std::vector<ReleaseSide> mRelease;
     EventQueue<Event> mEvents;
     nsecs_t mNow = 0;
-    nsecs_t mPeriod = 0;         // the display's
-    nsecs_t mPendingPeriod = 0;  // the display's from its next vsync on; 0: no change
+    double mHz = 0;  // the display's rate, and its period
+    nsecs_t mPeriod = 0;
+    double mPendingHz = 0;  // the display's rate from its next vsync on; 0: no change
     std::vector<ScenarioChange> mChanges;
 };
 
@@ -234,6 +235,7 @@ void Simulation::SimulatedTimeLoop::run(Compositor& compositor, const std::atomi
         push(mLayers[i]->game->nextFrameStart(), Event(Event::Kind::FRAME_START, i));
     }
     compositor.setAfterComposition([this](size_t layer) { decideIfWoken(layer); });
+    mHz = mSimulation.mOptions.hz;
     mPeriod = mSimulation.mRefreshPeriod;
     push(start, Event(Event::Kind::VSYNC));
     scheduleScenario();
@@ -262,7 +264,7 @@ void Simulation::SimulatedTimeLoop::run(Compositor& compositor, const std::atomi
     if (end != LATEST) mNow = std::max(mNow, end);
     ClockOverride::setNow(mNow);
     result.endTime = mNow;
-    result.displayHz = static_cast<double>(SECOND) / static_cast<double>(mPeriod);
+    result.displayHz = mHz;
 }
 
 void Simulation::SimulatedTimeLoop::scheduleScenario() {
@@ -291,7 +293,7 @@ void Simulation::SimulatedTimeLoop::change(const ScenarioChange& change, Composi
     switch (change.kind) {
         case ScenarioChange::Kind::DISPLAY_RATE:
             // The vsync already due comes at the old rate; the display runs at the new one after.
-            mPendingPeriod = static_cast<nsecs_t>(std::llround(SECOND / change.value));
+            mPendingHz = change.value;
             break;
         case ScenarioChange::Kind::CLIENT_SHARE:
             compositor.setClientCompositionShare(change.value);
@@ -309,9 +311,10 @@ void Simulation::SimulatedTimeLoop::play(Event& event, Compositor& compositor) {
     switch (event.kind) {
         case Event::Kind::VSYNC:
             compositor.refresh(mNow);
-            if (mPendingPeriod > 0) {
-                mPeriod = mPendingPeriod;
-                mPendingPeriod = 0;
+            if (mPendingHz > 0) {
+                mHz = mPendingHz;
+                mPendingHz = 0;
+                mPeriod = static_cast<nsecs_t>(std::llround(SECOND / mHz));
                 compositor.setRefreshPeriod(mPeriod, mNow + mPeriod);
             }
             push(mNow + mPeriod, Event(Event::Kind::VSYNC));
@@ -507,7 +510,10 @@ RunResult Simulation::run(const std::vector<RecordSink*>& sinks,
         layers.push_back(
                 std::make_unique<Layer>(mOptions, mLayers[i], simulated ? sinks[i] : nullptr));
     }
-    // The layers' observers subscribed as they were created; this hands them their settings.
+    // The layers' observers subscribed as they were created; this hands them their settings, and
+    // the recorders hear the display delay the settings set.
+    for (auto& layer : layers)
+        layer->recorder->startListening();
     android::Interpolation::SettingsController::getInstance()->notifyChanges();
 
     std::optional<SimulatedTimeLoop> loop;
@@ -528,7 +534,6 @@ RunResult Simulation::run(const std::vector<RecordSink*>& sinks,
                           mOptions.loop,     picturesUntil};
     std::vector<DisplayedLayer> displayed;
     for (auto& layer : layers) {
-        layer->recorder->startListening();
         layer->game = std::make_unique<Game>(gameConfig, layer->queue, *layer->layerHost, *fences,
                                              *layer->recorder, mStartTime);
         displayed.push_back({&layer->queue, layer->layerHost.get(), layer->recorder.get()});
