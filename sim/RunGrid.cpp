@@ -71,6 +71,13 @@ int finishGrid(const Options& options, GridRuns& grid, const std::string& summar
                const std::string& cellsText) {
     int status = grid.interrupted ? 130 : 0;
     std::string text = summary;
+    std::vector<const Summary*> layers;
+    for (const SummaryColumn& column : grid.columns())
+        layers.push_back(column.summary);
+    page.ledger = ledgerLines(layers);
+    text += "Watchdog warnings: time in the run, time of day, game, code, value\n";
+    for (const std::string& line : page.ledger)
+        text += "  " + line + "\n";
     for (size_t i = 0; i < grid.runs.size(); i++) {
         for (const CheckedExpectation& checked : grid.runs[i].expectations) {
             const std::string line = grid.titles[i] + ": " + checked.line;
@@ -82,13 +89,6 @@ int finishGrid(const Options& options, GridRuns& grid, const std::string& summar
             page.expectations.push_back(line);
         }
     }
-    std::vector<const Summary*> layers;
-    for (const SummaryColumn& column : grid.columns())
-        layers.push_back(column.summary);
-    page.ledger = ledgerLines(layers);
-    text += "Watchdog warnings: time in the run, time of day, game, code, value\n";
-    for (const std::string& line : page.ledger)
-        text += "  " + line + "\n";
 
     const std::filesystem::path out(options.outDir);
     {

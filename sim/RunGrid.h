@@ -51,9 +51,9 @@ std::vector<std::pair<std::string, std::string>> gridOptions(
         const GridRuns& grid, const std::vector<host::SettingValue>& settings);
 
 // What a grid leaves beside its cells' folders: summary.txt with `summary` and report.html with
-// `page` (the expectations and the ledger of every run added). Prints the summary and every
-// failed expectation (all of them unless quiet) and lists the files; returns the exit status:
-// 130 when interrupted, 1 when an expectation failed or a file could not be written, else 0.
+// `page`, the ledger and the expectations of every run added to both. Prints all that and the
+// files, or with --quiet the failed expectations only; returns the exit status: 130 when
+// interrupted, 1 when an expectation failed or a file could not be written, else 0.
 int finishGrid(const Options& options, GridRuns& grid, const std::string& summary, ReportPage page,
                const std::string& cellsText);
 

@@ -35,10 +35,12 @@ constexpr std::string_view DEFAULTABLE_OPTIONS[] = {
         "picture-at",  "client-composition",
 };
 
-std::string known(std::initializer_list<std::string_view> keys) {
+// "a, b, c".
+template <typename Names>
+std::string listed(const Names& names) {
     std::string text;
-    for (std::string_view key : keys)
-        text += (text.empty() ? "" : ", ") + std::string(key);
+    for (std::string_view name : names)
+        text += (text.empty() ? "" : ", ") + std::string(name);
     return text;
 }
 
@@ -76,7 +78,7 @@ public:
         for (const std::string& name : object.getMemberNames()) {
             if (std::find(keys.begin(), keys.end(), name) == keys.end()) {
                 return fail(where,
-                            "unknown key " + sim::quoted(name) + " (known: " + known(keys) + ")");
+                            "unknown key " + sim::quoted(name) + " (known: " + listed(keys) + ")");
             }
         }
         return true;
@@ -146,11 +148,9 @@ public:
             const auto* option =
                     std::find(std::begin(DEFAULTABLE_OPTIONS), std::end(DEFAULTABLE_OPTIONS), name);
             if (option == std::end(DEFAULTABLE_OPTIONS)) {
-                std::string all;
-                for (std::string_view each : DEFAULTABLE_OPTIONS)
-                    all += (all.empty() ? "" : ", ") + std::string(each);
-                fail("options", "no default for " + sim::quoted(name) +
-                                        " (options a scenario sets: " + all + ")");
+                fail("options",
+                     "no default for " + sim::quoted(name) +
+                             " (options a scenario sets: " + listed(DEFAULTABLE_OPTIONS) + ")");
                 return;
             }
             const Json::Value& value = object[name];
@@ -370,11 +370,8 @@ Result<Scenario> readScenario(std::string_view nameOrPath) {
     if (!isPath) {
         const std::vector<std::string> names = scenarioNames();
         if (std::find(names.begin(), names.end(), nameOrPath) == names.end()) {
-            std::string all;
-            for (const std::string& name : names)
-                all += (all.empty() ? "" : ", ") + name;
             return R::failure(errorLine("no scenario named " + quoted(nameOrPath) +
-                                        " (shipped: " + all + "; or give a .json file)"));
+                                        " (shipped: " + listed(names) + "; or give a .json file)"));
         }
         path = (std::filesystem::path(scenarioFolder()) / (path + ".json")).string();
     }
