@@ -19,17 +19,6 @@ constexpr double NS_PER_MS = 1e6;
 // Blank lines are skipped, but not without end (a pipe of newlines is not a capture).
 constexpr size_t MAX_LINES_PER_FRAME = 2;
 
-std::vector<std::string_view> splitCells(std::string_view line) {
-    std::vector<std::string_view> cells;
-    size_t start = 0;
-    while (true) {
-        const size_t comma = line.find(',', start);
-        cells.push_back(trim(line.substr(start, comma - start)));
-        if (comma == std::string_view::npos) return cells;
-        start = comma + 1;
-    }
-}
-
 // Reads one line without keeping more than `limit` + 1 characters of it: a longer line comes back
 // that long, so that the caller can refuse it without the rest being read. False at the end.
 bool readLine(std::istream& in, std::string& line, size_t limit) {
@@ -95,7 +84,7 @@ std::optional<size_t> CaptureParser::column(std::string_view name) const {
 }
 
 std::string CaptureParser::header(std::string_view line) {
-    const auto cells = splitCells(line);
+    const auto cells = splitAtCommas(line);
     for (size_t i = 0; i < cells.size(); i++) {
         for (size_t j = 0; j < i; j++) {
             if (cells[j] == cells[i])
@@ -187,7 +176,7 @@ std::string CaptureParser::presentMonRow(const std::vector<std::string_view>& ce
 }
 
 std::string CaptureParser::row(std::string_view line) {
-    const auto cells = splitCells(line);
+    const auto cells = splitAtCommas(line);
     if (cells.size() != mColumns.size()) {
         return at(mLine, "expected " + std::to_string(mColumns.size()) + " cells, found " +
                                  std::to_string(cells.size()));

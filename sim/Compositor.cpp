@@ -29,7 +29,10 @@ Compositor::Compositor(const Config& config, std::vector<DisplayedLayer> layers)
       mLayers(std::move(layers)),
       mScreens(mLayers.size()),
       mAccumulator(size_t{config.width} * 4),
-      mRandom(config.seed) {
+      mRandom(config.seed),
+      mPeriod(config.refreshPeriod),
+      mBaseVsync(config.firstVsync),
+      mClientCompositionShare(config.clientCompositionShare) {
     for (Screen& screen : mScreens) {
         screen.scanline.assign(size_t{config.width} * 3, 0);
         screen.nextStatistics = config.firstVsync + SECOND;
@@ -63,20 +66,27 @@ void Compositor::run() {
             if (mStopped.wait_until(lock, deadline, [this] { return mStopping; })) return;
         }
         refresh(vsync);
-        vsync += mConfig.refreshPeriod;
+        vsync += mPeriod;
         const nsecs_t now = systemTime(SYSTEM_TIME_MONOTONIC);
         while (vsync < now)
-            vsync += mConfig.refreshPeriod;
+            vsync += mPeriod;
     }
 }
 
+void Compositor::setRefreshPeriod(nsecs_t period, nsecs_t nextVsync) {
+    mBaseIndex = mLastIndex + 1;
+    mBaseVsync = nextVsync;
+    mPeriod = period;
+}
+
 void Compositor::refresh(nsecs_t vsync) {
-    const auto index = static_cast<uint64_t>((vsync - mConfig.firstVsync) / mConfig.refreshPeriod);
-    const nsecs_t present = vsync + mConfig.refreshPeriod;
+    const auto index = mBaseIndex + static_cast<uint64_t>((vsync - mBaseVsync) / mPeriod);
+    mLastIndex = index;
+    const nsecs_t present = vsync + mPeriod;
     const auto presentFence =
             std::make_shared<android::FenceTime>(android::Fence::createSignalled(present));
-    const bool clientComposed = mConfig.clientCompositionShare > 0 &&
-                                mClientDraw(mRandom) < mConfig.clientCompositionShare;
+    const bool clientComposed =
+            mClientCompositionShare > 0 && mClientDraw(mRandom) < mClientCompositionShare;
     for (size_t layer = 0; layer < mLayers.size(); layer++) {
         refreshLayer(layer, index, vsync, present, presentFence, clientComposed);
     }

@@ -56,8 +56,12 @@ public:
 
     void start();
     void stop();
-    // Composes every layer at `vsync`, a whole number of periods after the first.
+    // Composes every layer at `vsync`, a whole number of periods after the previous one.
     void refresh(nsecs_t vsync);
+    // Simulated time: the display's rate changes; its next vsync is at `nextVsync`.
+    void setRefreshPeriod(nsecs_t period, nsecs_t nextVsync);
+    // Simulated time: from now on this share of compositions falls back to client composition.
+    void setClientCompositionShare(double share) { mClientCompositionShare = share; }
     // Simulated time: called with the layer's index once a layer's composition is done, before its
     // refresh is recorded. On threads, the release side acts on a composition at once, while the
     // display records the refresh; a simulation lets it act here.
@@ -87,6 +91,13 @@ private:
     std::uniform_real_distribution<double> mClientDraw{0.0, 1.0};
     const android::Interpolation::RenderState mNothing;  // what a layer that does not present composes
     std::function<void(size_t)> mAfterComposition;
+    // The display's rate, and the vsync and index that refresh indices count from (display
+    // thread only).
+    nsecs_t mPeriod;
+    nsecs_t mBaseVsync;
+    uint64_t mBaseIndex = 0;
+    uint64_t mLastIndex = 0;
+    double mClientCompositionShare;
 
     std::mutex mMutex;
     std::condition_variable mStopped;

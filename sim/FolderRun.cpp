@@ -7,6 +7,7 @@
 #include <fstream>
 
 #include "sim/EngineLog.h"
+#include "sim/GameScript.h"
 #include "sim/Outputs.h"
 #include "sim/SettingsKeys.h"
 
@@ -31,7 +32,11 @@ std::string modeText(uint32_t mode) {
     return std::to_string(mode) + " " + modeName(mode);
 }
 
-std::string gameText(const Options& options, const Capture* capture) {
+std::string gameText(const Options& options, const Capture* capture, const Scenario* scenario) {
+    if (scenario != nullptr) {
+        return "scenario " + scenario->name + " (" + plain(options.fps) + " fps to start, seed " +
+               std::to_string(options.seed) + ")";
+    }
     if (capture != nullptr) {
         return "capture " + std::filesystem::path(options.capturePath).filename().string() + " (" +
                std::to_string(capture->frames.size()) + " frames over " +
@@ -54,14 +59,27 @@ std::string buffersText(const LayerPlan& layer) {
            (layer.buffers.fixed ? " (fixed)" : " (sized by the host)");
 }
 
+std::string displayText(const Options& options, const Scenario* scenario) {
+    std::string text = plain(options.hz) + " Hz";
+    if (scenario != nullptr) {
+        for (const DisplayChange& change : scenario->display)
+            text += ", " + plain(change.hz) + " Hz from " + plain(change.at) + " s";
+    }
+    return text;
+}
+
 std::vector<std::pair<std::string, std::string>> describe(
-        const Options& options, const Capture* capture,
+        const Options& options, const Capture* capture, const Scenario* scenario,
         const std::vector<host::SettingValue>& settings, const Simulation& simulation) {
     std::vector<std::pair<std::string, std::string>> rows = {
-            {"mode", modeText(options.mode)},       {"game", gameText(options, capture)},
-            {"display", plain(options.hz) + " Hz"}, {"duration", durationText(options, capture)},
+            {"mode", modeText(options.mode)},
+            {"game", gameText(options, capture, scenario)},
+            {"display", displayText(options, scenario)},
+            {"duration", durationText(options, capture)},
             {"time", timeModeName(options.time)},
     };
+    if (scenario != nullptr && !scenario->description.empty())
+        rows.push_back({"scenario", scenario->description});
     for (const LayerPlan& layer : simulation.layers())
         rows.push_back({layer.role + " buffers", buffersText(layer)});
     std::string given;
@@ -94,12 +112,12 @@ Json::Value runJson(const std::vector<std::pair<std::string, std::string>>& desc
 }
 
 void announce(std::ostream& out, const Options& options, const Capture* capture,
-              const Simulation& simulation) {
+              const Scenario* scenario, const Simulation& simulation) {
     out << "verolux-sim: mode " << modeText(options.mode)
         << (options.layers > 1 ? " (" + std::to_string(options.layers) + " layers)" : "")
         << (options.reference ? " against mode 2 no interpolation" : "") << "; "
-        << gameText(options, capture) << " on a " << plain(options.hz) << " Hz display; "
-        << simulation.layers().front().buffers.count << " buffers";
+        << gameText(options, capture, scenario) << " on a " << displayText(options, scenario)
+        << " display; " << simulation.layers().front().buffers.count << " buffers";
     if (options.reference) out << " (reference " << simulation.layers()[1].buffers.count << ")";
     out << "; " << durationText(options, capture) << " in " << timeModeName(options.time)
         << " time. Ctrl-C stops early and keeps the results." << std::endl;
@@ -115,10 +133,40 @@ void writeFile(const std::filesystem::path& path, const char* bytes, size_t size
 
 }  // namespace
 
+Summary summarizeLayer(const Options& options, const Simulation& simulation,
+                       const RunResult& result, size_t layer, const MeasuredLayer& measured,
+                       const Capture* capture, const Scenario* scenario) {
+    const LayerPlan& plan = simulation.layers()[layer];
+    LayerFacts facts;
+    facts.role = plan.role;
+    facts.mode = plan.mode;
+    facts.time = options.time;
+    facts.runSec = (result.endTime - simulation.startTime()) / 1e9;
+    facts.buffers = plan.buffers.count;
+    facts.buffersFixed = plan.buffers.fixed;
+    facts.bufferBytes =
+            uint64_t{plan.buffers.count} * options.gameWidth * options.gameHeight * BYTES_PER_PIXEL;
+    facts.resolution = std::to_string(options.gameWidth) + "x" + std::to_string(options.gameHeight);
+    facts.ownFps = options.fps;
+    if (capture != nullptr) facts.ownFps = capture->fpsOverFirst(measured.framesQueued);
+    if (scenario != nullptr) {
+        facts.ownFps = GameScript(options.fps, options.jitterMs, options.renderMs, &scenario->game)
+                               .meanFps(facts.runSec);
+    }
+    facts.refreshHz = result.displayHz;
+    if (scenario != nullptr) {
+        for (const DisplayChange& change : scenario->display)
+            facts.refreshRateChanged |= change.at < facts.runSec && change.hz != options.hz;
+    }
+    facts.startTime = simulation.startTime();
+    facts.captureEnded = result.captureEnded;
+    return {facts, measured};
+}
+
 Result<FolderRun> runIntoFolder(const Options& options,
                                 const std::vector<host::SettingValue>& settings,
                                 const Capture* capture, const std::atomic<bool>& interrupted,
-                                std::ostream* progress) {
+                                std::ostream* progress, const Scenario* scenario) {
     using R = Result<FolderRun>;
     std::error_code error;
     std::filesystem::create_directories(options.outDir, error);
@@ -130,7 +178,7 @@ Result<FolderRun> runIntoFolder(const Options& options,
         return R::failure(opened.error);
     }
 
-    Simulation simulation(options, settings, capture);
+    Simulation simulation(options, settings, capture, scenario);
     std::vector<Outputs::Layer> layers;
     // The copies of the run (--layers) are measured only: their files would repeat the run's.
     const size_t withFiles = options.reference ? 2 : 1;
@@ -140,7 +188,7 @@ Result<FolderRun> runIntoFolder(const Options& options,
     }
     R result;
     FolderRun& run = result.value;
-    run.described = describe(options, capture, settings, simulation);
+    run.described = describe(options, capture, scenario, settings, simulation);
     const Json::Value runDescription = runJson(run.described, simulation, layers, options);
     {
         std::ofstream file(out / "run.json");
@@ -153,7 +201,7 @@ Result<FolderRun> runIntoFolder(const Options& options,
         return R::failure(opened.error);
     }
 
-    if (progress != nullptr) announce(*progress, options, capture, simulation);
+    if (progress != nullptr) announce(*progress, options, capture, scenario, simulation);
     run.result = simulation.run(outputs.sinks(), interrupted, progress);
     if (progress != nullptr && options.time == TimeMode::SIMULATED) {
         const double simulated = (run.result.endTime - simulation.startTime()) / 1e9;
@@ -169,30 +217,19 @@ Result<FolderRun> runIntoFolder(const Options& options,
               run.result.ringLogs.size(), run.errors);
 
     for (size_t i = 0; i < simulation.layers().size(); i++) {
-        const LayerPlan& plan = simulation.layers()[i];
-        LayerFacts facts;
-        facts.role = plan.role;
-        facts.mode = plan.mode;
-        facts.time = options.time;
-        facts.runSec = (run.result.endTime - simulation.startTime()) / 1e9;
-        facts.buffers = plan.buffers.count;
-        facts.buffersFixed = plan.buffers.fixed;
-        facts.bufferBytes = uint64_t{plan.buffers.count} * options.gameWidth * options.gameHeight *
-                            BYTES_PER_PIXEL;
-        facts.resolution =
-                std::to_string(options.gameWidth) + "x" + std::to_string(options.gameHeight);
-        const MeasuredLayer measured = outputs.measures(i).result();
-        facts.ownFps =
-                capture != nullptr ? capture->fpsOverFirst(measured.framesQueued) : options.fps;
-        facts.refreshHz = options.hz;
-        facts.startTime = simulation.startTime();
-        facts.captureEnded = run.result.captureEnded;
-        run.summaries.push_back({facts, measured});
+        run.summaries.push_back(summarizeLayer(options, simulation, run.result, i,
+                                               outputs.measures(i).result(), capture, scenario));
     }
     run.hasReference = options.reference;
     const std::vector<Summary> copies(run.summaries.begin() + (options.reference ? 2 : 1),
                                       run.summaries.end());
     run.summaryText = formatSummary(run.run(), run.reference()) + formatCopies(copies);
+    if (scenario != nullptr && !scenario->expectations.empty()) {
+        run.expectations = checkExpectations(*scenario, run.run());
+        run.summaryText += "Expectations of scenario " + scenario->name + ":\n";
+        for (const CheckedExpectation& checked : run.expectations)
+            run.summaryText += "  " + checked.line + "\n";
+    }
     writeFile(out / "summary.txt", run.summaryText.data(), run.summaryText.size(), run.errors);
     run.engineLogLines = engineLog.lines();
     return result;

@@ -35,10 +35,9 @@ Game::Game(GameConfig config, BufferQueue& queue, host::LayerHost& host, FenceSc
       mHost(host),
       mGpu(gpu),
       mRecorder(recorder),
+      mStartTime(startTime),
+      mScript(config.fps, config.jitterMs, config.renderMs, config.segments),
       mRandom(config.seed),
-      mJitter(0.0, config.jitterMs),
-      mRenderTime(config.renderMs, config.renderMs / 4),
-      mPeriod(toNanos(1000.0 / config.fps)),
       mFrameStart(startTime) {}
 
 Game::~Game() {
@@ -119,10 +118,16 @@ bool Game::tryProduce() {
 
 void Game::produce(int slot, nsecs_t requestTime, nsecs_t dequeueTime) {
     const uint64_t number = mNumber++;
+    using Normal = std::normal_distribution<double>::param_type;
+    const GameScript::Pace pace =
+            mScript.next(static_cast<double>(mFrameStart - mStartTime) / SECOND);
     // Both drawn for every frame, in this order, so that a seed gives the same game whatever
     // replaces them.
-    nsecs_t render = std::max<nsecs_t>(0, toNanos(mRenderTime(mRandom)));
-    nsecs_t interval = std::max(MS, mPeriod + toNanos(mJitter(mRandom)));
+    nsecs_t render = std::max<nsecs_t>(
+            0, toNanos(mRenderTime(mRandom, Normal(pace.renderMs, pace.renderMs / 4))));
+    nsecs_t interval = std::max(
+            MS, toNanos(1000.0 / pace.fps) + toNanos(mJitter(mRandom, Normal(0.0, pace.jitterMs))));
+    if (pace.spikeRenderMs) render = toNanos(*pace.spikeRenderMs);
     const std::vector<CaptureFrame>* capture =
             mConfig.capture != nullptr ? &mConfig.capture->frames : nullptr;
     if (capture != nullptr) {
@@ -140,11 +145,14 @@ void Game::produce(int slot, nsecs_t requestTime, nsecs_t dequeueTime) {
     android::sp<android::Fence> fence = android::Fence::createPending();
     const nsecs_t queueTime = now();
     mGpu.signalAt(fence, queueTime + render);
+    const nsecs_t timestamp =
+            pace.reuseTimestamp && mLastTimestamp >= 0 ? mLastTimestamp : queueTime;
+    mLastTimestamp = timestamp;
 
     mQueue.markQueued(slot, number);
-    mRecorder.frameQueued(number, queueTime);
-    mHost.onBufferQueued(number, slot, buffer, queueTime, fence);
-    mQueue.makeAcquirable({slot, number, queueTime, std::move(fence)});
+    mRecorder.frameQueued(number, queueTime, timestamp);
+    mHost.onBufferQueued(number, slot, buffer, timestamp, fence);
+    mQueue.makeAcquirable({slot, number, timestamp, std::move(fence)});
 
     if (capture != nullptr) {
         mReplayed++;

@@ -12,6 +12,7 @@
 #include "sim/BufferQueue.h"
 #include "sim/Capture.h"
 #include "sim/FenceScheduler.h"
+#include "sim/GameScript.h"
 #include "sim/LayerRecorder.h"
 
 namespace verolux::sim {
@@ -22,7 +23,10 @@ struct GameConfig {
     double renderMs = 8;  // mean GPU time of a frame
     uint64_t seed = 1;
     const Capture* capture = nullptr;  // when set, replayed instead of fps and jitter
-    bool loop = false;                 // replay the capture again when it ends
+    // A scenario's changes to fps, jitter and render time over the run, its render-time spikes
+    // and reused timestamps; null or empty for none.
+    const std::vector<GameSegment>* segments = nullptr;
+    bool loop = false;  // replay the capture again when it ends
     // Frames that get their buffer from then on are not drawn: no picture shown from then on is
     // looked at (see Compositor::Config::picturesUntil).
     nsecs_t drawUntil = std::numeric_limits<nsecs_t>::max();
@@ -34,7 +38,8 @@ struct GameConfig {
 // and their render times. A game that had to wait starts its next frame one interval after the
 // late one, not at its old time: waiting slows it down, as it would a real game. While the host
 // applies a game-rate limit, the game starts no frame sooner than one limit period after the
-// previous one started.
+// previous one started. A scenario's game segments change its rate, jitter and render time as
+// the run goes (GameScript).
 //
 // In real time the game runs on a thread of its own (start, stop). In simulated time the caller
 // keeps the time: at nextFrameStart() it calls tryProduce(), and again whenever a buffer may have
@@ -77,11 +82,14 @@ private:
     FenceScheduler& mGpu;
     LayerRecorder& mRecorder;
 
+    const nsecs_t mStartTime;
+
     // The producer's own (its thread's in real time).
+    GameScript mScript;
     std::mt19937_64 mRandom;
     std::normal_distribution<double> mJitter;
     std::normal_distribution<double> mRenderTime;
-    const nsecs_t mPeriod;
+    nsecs_t mLastTimestamp = -1;
     uint64_t mNumber = 1;  // the frame to draw next
     size_t mReplayed = 0;  // the capture frame to play next
     nsecs_t mFrameStart;   // when the frame to draw next starts, -1 after the capture's last

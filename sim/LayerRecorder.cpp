@@ -20,31 +20,47 @@ const char* pictureName(Picture picture) {
     return "held";
 }
 
+namespace {
+
+constexpr uint32_t LISTENED_EVENTS = eDelayChangedEvent | eFrameReceivedEvent;
+
+}  // namespace
+
 LayerRecorder::LayerRecorder(uint32_t uid, RecordSink& sink) : mUid(uid), mSink(sink) {
     mInFlight.reserve(64);
 }
 
 void LayerRecorder::startListening() {
-    EventDispatcher::subscribe(mUid, eDelayChangedEvent, this);
+    EventDispatcher::subscribe(mUid, LISTENED_EVENTS, this);
 }
 
 void LayerRecorder::stopListening() {
-    EventDispatcher::unsubscribe(mUid, eDelayChangedEvent, this);
+    EventDispatcher::unsubscribe(mUid, LISTENED_EVENTS, this);
 }
 
 void LayerRecorder::onEvent(const EventType& type, const nsecs_t& time, const EventData& data) {
+    if (const auto* frame = std::get_if<android::FrameItem>(&data);
+        frame != nullptr && type == eFrameReceivedEvent) {
+        std::lock_guard lock(mMutex);
+        if (FrameRecord* record = inFlightLocked(frame->mIndex)) {
+            record->engineTimestamp = frame->mTimestamp;
+        }
+        return;
+    }
     const auto* delay = std::get_if<nsecs_t>(&data);
     if (type != eDelayChangedEvent || delay == nullptr) return;
     mDelay = *delay;
+    if (!mStarted) return;
     std::lock_guard lock(mMutex);
     mSink.onDelayChange(time, *delay);
 }
 
 void LayerRecorder::start(nsecs_t startTime, nsecs_t initialDelay) {
-    if (initialDelay < 0) return;
-    mDelay = initialDelay;
+    mStarted = true;
+    if (mDelay < 0) mDelay = initialDelay;
+    if (mDelay < 0) return;
     std::lock_guard lock(mMutex);
-    mSink.onDelayChange(startTime, initialDelay);
+    mSink.onDelayChange(startTime, mDelay);
 }
 
 void LayerRecorder::finish() {
@@ -78,9 +94,12 @@ void LayerRecorder::frameDequeued(uint64_t number, int slot, nsecs_t contentTime
     frame.dequeueTime = dequeueTime;
 }
 
-void LayerRecorder::frameQueued(uint64_t number, nsecs_t queueTime) {
+void LayerRecorder::frameQueued(uint64_t number, nsecs_t queueTime, nsecs_t timestamp) {
     std::lock_guard lock(mMutex);
-    if (FrameRecord* frame = inFlightLocked(number)) frame->queueTime = queueTime;
+    if (FrameRecord* frame = inFlightLocked(number)) {
+        frame->queueTime = queueTime;
+        frame->timestamp = timestamp;
+    }
 }
 
 void LayerRecorder::frameAcquired(uint64_t number, nsecs_t acquireTime, nsecs_t renderDoneTime) {

@@ -14,7 +14,8 @@ namespace verolux::sim {
 // game's request for a buffer to the buffer's release, decides at every refresh what the screen
 // shows (and which frame leads the picture), and passes on the engine's display-delay changes.
 // Callers pass every time in; it may be called from several threads, and calls its sink with its
-// own mutex held, so the sink must not call back.
+// own mutex held, so the sink must not call back. It hears the engine announce each frame that
+// enters its queue, with the timestamp the engine gave it.
 class LayerRecorder : public android::Interpolation::EventDispatcher::EventReceiver {
 public:
     // Completed frames wait for the earlier ones at most this long before they are passed on out
@@ -28,7 +29,8 @@ public:
     void onEvent(const android::Interpolation::EventType& type, const nsecs_t& time,
                  const android::Interpolation::EventData& data) override;
 
-    // The delay frames get from the start, when the engine applies one (-1: none).
+    // The delay frames get from the start: the last the engine announced before it, or else
+    // `initialDelay` when the engine applies one (-1: none).
     void start(nsecs_t startTime, nsecs_t initialDelay);
     // Passes on the frames still in flight.
     void finish();
@@ -36,7 +38,7 @@ public:
     // The game's side.
     void frameDequeued(uint64_t number, int slot, nsecs_t contentTime, nsecs_t startTime,
                        nsecs_t dequeueTime);
-    void frameQueued(uint64_t number, nsecs_t queueTime);
+    void frameQueued(uint64_t number, nsecs_t queueTime, nsecs_t timestamp);
     // The display's side.
     void frameAcquired(uint64_t number, nsecs_t acquireTime, nsecs_t renderDoneTime);
     // A refresh with its index, times and composed items (weights included): the recorder adds
@@ -75,6 +77,7 @@ private:
     std::atomic<size_t> mFrameCount{0};
     std::atomic<size_t> mRefreshCount{0};
     std::atomic<nsecs_t> mDelay{-1};
+    std::atomic<bool> mStarted{false};  // delay changes before the start set the first delay
     std::mutex mMutex;
     RecordSink& mSink;                         // called under mMutex
     std::vector<FrameRecord> mInFlight;        // guarded by mMutex; dequeued and not yet released

@@ -64,6 +64,9 @@ void Measures::onFrame(const FrameRecord& frame) {
     if (frame.startTime >= 0 && frame.dequeueTime >= frame.startTime) {
         mBufferWait += frame.dequeueTime - frame.startTime;
     }
+    if (frame.engineTimestamp >= 0 && frame.engineTimestamp != frame.timestamp) {
+        mClockTimeFrom = std::min(mClockTimeFrom.value_or(frame.queueTime), frame.queueTime);
+    }
     if (!frame.dropped()) {
         mFramesShown++;
         mLatency.add(frame.firstPresentTime - frame.queueTime);
@@ -108,7 +111,11 @@ void Measures::onRefresh(const RefreshRecord& refresh) {
                                  static_cast<double>(refresh.presentTime - mLastPresent);
             const auto magnitude = static_cast<nsecs_t>(std::llround(std::fabs(error)));
             mAnimationError.add(magnitude);
-            if (2 * magnitude > mRefreshPeriod) mErrorsOverHalfPeriod++;
+            // The period of this refresh: the display may change its rate during a run.
+            const nsecs_t period = refresh.presentTime > refresh.vsyncTime
+                                           ? refresh.presentTime - refresh.vsyncTime
+                                           : mRefreshPeriod;
+            if (2 * magnitude > period) mErrorsOverHalfPeriod++;
         }
         mLastContent = refresh.contentTime;
         mLastPresent = refresh.presentTime;
@@ -161,6 +168,7 @@ MeasuredLayer Measures::result() const {
     m.framesQueued = mFramesQueued;
     m.gameFps = ratesOf(mGameFrameTimes);
     m.bufferWaitMs = static_cast<double>(mBufferWait) / NS_PER_MS;
+    m.clockTimeFrom = mClockTimeFrom;
 
     m.displayFps = ratesOf(mDisplayFrameTimes);
     m.refreshes = mRefreshes;

@@ -30,6 +30,9 @@ struct MeasuredLayer {
     uint64_t framesQueued = 0;
     Rates gameFps;
     double bufferWaitMs = 0;  // the producer's waits for a free buffer, summed
+    // The queue time of the first frame the engine stamped with its own clock rather than the
+    // game's timestamp (as it does for good once the game reused a timestamp).
+    std::optional<nsecs_t> clockTimeFrom;
 
     // Display side.
     Rates displayFps;
@@ -113,6 +116,7 @@ private:
     uint64_t mFramesShown = 0;
     nsecs_t mLastQueueTime = -1;
     nsecs_t mBufferWait = 0;
+    std::optional<nsecs_t> mClockTimeFrom;
     Histogram mGameFrameTimes;
     Histogram mLatency;
 

@@ -1,5 +1,6 @@
 #include "sim/Options.h"
 
+#include <algorithm>
 #include <charconv>
 #include <cstdio>
 
@@ -59,7 +60,12 @@ const TextOption TEXT_OPTIONS[] = {
         {"--out", &Options::outDir},
         {"--capture", &Options::capturePath},
         {"--settings", &Options::settingsPath},
+        {"--scenario", &Options::scenario},
 };
+
+// More cells than anyone reads in a table; each is a run of its own.
+constexpr size_t MAX_SWEEP_VALUES = 64;
+constexpr size_t MAX_SWEEP_KEYS = 2;
 
 std::string formatNumber(double value) {
     char text[32];
@@ -112,6 +118,58 @@ std::string applySeed(std::string_view text, Options& options) {
     return {};
 }
 
+std::string applyCompare(std::string_view text, Options& options) {
+    options.compare.clear();
+    for (std::string_view item : splitAtCommas(text)) {
+        const auto mode = parseInteger(item);
+        if (!mode || *mode < 0 || *mode > 5) {
+            return errorLine("--compare expects modes from 0 to 5, separated by commas (got " +
+                             quoted(text) + ")");
+        }
+        const auto value = static_cast<uint32_t>(*mode);
+        if (std::find(options.compare.begin(), options.compare.end(), value) !=
+            options.compare.end()) {
+            return errorLine("--compare names mode " + std::to_string(value) + " twice");
+        }
+        options.compare.push_back(value);
+    }
+    if (options.compare.size() < 2) {
+        return errorLine("--compare expects two or more modes (got " + quoted(text) + ")");
+    }
+    return {};
+}
+
+std::string applySweep(std::string_view text, Options& options) {
+    const size_t equals = text.find('=');
+    const std::string key(trim(text.substr(0, std::min(equals, text.size()))));
+    if (equals == std::string_view::npos || findSettingKey(key) == nullptr) {
+        return errorLine("--sweep expects a settings key and its values, key=v1,v2,... (got " +
+                         quoted(text) + ")");
+    }
+    if (findSettingKey(key)->type == SettingType::POINTS) {
+        return errorLine("--sweep cannot sweep " + key + ": its values hold commas");
+    }
+    if (options.sweep.size() == MAX_SWEEP_KEYS) return errorLine("--sweep takes two keys at most");
+    for (const SweepAxis& axis : options.sweep) {
+        if (axis.key == key) return errorLine("--sweep gives " + key + " twice");
+    }
+    SweepAxis axis;
+    axis.key = key;
+    for (std::string_view item : splitAtCommas(text.substr(equals + 1))) {
+        Result<host::SettingValue> value = parseSettingAssignment(key + "=" + std::string(item));
+        if (!value.ok())
+            return errorLine("--sweep" + value.error.substr(errorLine("--set").size()));
+        axis.texts.emplace_back(item);
+        axis.values.push_back(std::move(value.value));
+    }
+    if (axis.values.size() > MAX_SWEEP_VALUES) {
+        return errorLine("--sweep takes at most " + std::to_string(MAX_SWEEP_VALUES) +
+                         " values per key");
+    }
+    options.sweep.push_back(std::move(axis));
+    return {};
+}
+
 // Applies an option that takes a value; false when the name is no such option.
 bool applyValueOption(std::string_view name, std::string_view text, Options& options,
                       std::string& error) {
@@ -154,6 +212,24 @@ bool applyValueOption(std::string_view name, std::string_view text, Options& opt
         if (value.ok()) options.overrides.push_back(std::move(value.value));
         return true;
     }
+    if (name == "--compare") {
+        error = applyCompare(text, options);
+        return true;
+    }
+    if (name == "--sweep") {
+        error = applySweep(text, options);
+        return true;
+    }
+    if (name == "--latency-budget-ms") {
+        const auto value = parseNumber(text);
+        if (!value || *value < 0 || *value > 10'000) {
+            error = errorLine("--latency-budget-ms expects a number from 0 to 10000 (got " +
+                              quoted(text) + ")");
+        } else {
+            options.latencyBudgetMs = value;
+        }
+        return true;
+    }
     return false;
 }
 
@@ -167,6 +243,8 @@ bool applyFlag(std::string_view name, Options& options) {
         options.reference = false;
     } else if (name == "--quiet") {
         options.quiet = true;
+    } else if (name == "--no-figures") {
+        options.figures = false;
     } else {
         return false;
     }
@@ -207,8 +285,30 @@ Result<Options> parseOptions(int argc, const char* const* argv) {
             i++;
         }
         if (!error.empty()) return R::failure(error);
+        options.givenOptions.emplace_back(name);
+    }
+    if (!options.compare.empty() && !options.sweep.empty()) {
+        return R::failure(errorLine("--compare and --sweep run grids of their own: give one"));
+    }
+    if (!options.compare.empty() && options.given("--mode")) {
+        return R::failure(errorLine("--compare gives the modes: drop --mode"));
+    }
+    if (options.latencyBudgetMs && options.sweep.empty()) {
+        return R::failure(errorLine("--latency-budget-ms marks the cells of a --sweep: add one"));
     }
     return result;
+}
+
+bool Options::given(std::string_view option) const {
+    return std::find(givenOptions.begin(), givenOptions.end(), option) != givenOptions.end();
+}
+
+std::string applyOption(std::string_view name, std::string_view text, Options& options) {
+    std::string error;
+    if (!applyValueOption(name, text, options, error)) {
+        return errorLine("unknown option " + quoted(name));
+    }
+    return error;
 }
 
 const char* timeModeName(TimeMode mode) {
@@ -230,6 +330,12 @@ Game:
   --loop             replay the capture until --duration is over
   --game-width W     the game's resolution, for the buffers' memory (default 1920 x 1080)
   --game-height H
+  --scenario NAME|FILE
+                     play a scenario: the game, display, client composition and settings
+                     over time, and what the run must show (checked at the end: a failed
+                     expectation exits with status 1); NAME is one of sim/scenarios/*.json
+                     (see its README); its options are defaults the command line overrides;
+                     simulated time only
 Display and library:
   --hz H             display refresh rate (default 60, 1 to 1000)
   --mode M           interpolation mode (default 0):
@@ -257,6 +363,16 @@ Run and output:
   --width W          width of the space-time picture in pixels, 16 to 4096 (default 320)
   --picture-at S     start of the space-time picture's 2 s window (default 1)
   --no-reference     skip the mode-2 run on the same game
+  --no-figures       draw no figures (matplotlib takes seconds); the report shows the tables
+Several runs of the same game, each into a subfolder of --out, then one table and one report:
+  --compare M,M,...  one run per mode (e.g. 0,2,3,5), side by side
+  --sweep KEY=V,V,...
+                     one run per value of a settings key; a second --sweep makes a grid of
+                     two keys (e.g. --sweep delayMs=32,48,64 --sweep hitTarget=0.95,0.99)
+  --latency-budget-ms MS
+                     mark the sweep's cells with the lowest animation error p95 whose
+                     latency p50 stays within MS (without it: the lowest overall)
+Others:
   --quiet            print nothing but errors
   --help             print this and exit
 
@@ -274,12 +390,14 @@ Settings keys (per game, then process-wide):
     return text + line + "\n";
 }
 
-Result<std::vector<host::SettingValue>> gatherSettings(const Options& options) {
+Result<std::vector<host::SettingValue>> gatherSettings(const Options& options,
+                                                       const std::vector<host::SettingValue>& first) {
     Result<std::vector<host::SettingValue>> result;
     if (!options.settingsPath.empty()) {
         result = readSettingsFile(options.settingsPath);
         if (!result.ok()) return result;
     }
+    result.value.insert(result.value.begin(), first.begin(), first.end());
     result.value.insert(result.value.end(), options.overrides.begin(), options.overrides.end());
     return result;
 }

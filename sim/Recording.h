@@ -16,13 +16,16 @@ namespace verolux::sim {
 
 // One game frame, complete once its buffer went back to the game.
 struct FrameRecord {
-    uint64_t number = 0;          // the producer's frame number, from 1
-    int slot = -1;                // buffer-queue slot
-    nsecs_t contentTime = -1;     // the game time the frame's picture shows
-    nsecs_t startTime = -1;       // when the game asked for a buffer to draw it into
-    nsecs_t dequeueTime = -1;     // when it got one; the difference is the wait for a free buffer
-    nsecs_t queueTime = -1;       // also the frame's timestamp
-    nsecs_t renderDoneTime = -1;  // when its acquire fence signalled
+    uint64_t number = 0;       // the producer's frame number, from 1
+    int slot = -1;             // buffer-queue slot
+    nsecs_t contentTime = -1;  // the game time the frame's picture shows
+    nsecs_t startTime = -1;    // when the game asked for a buffer to draw it into
+    nsecs_t dequeueTime = -1;  // when it got one; the difference is the wait for a free buffer
+    nsecs_t queueTime = -1;
+    nsecs_t timestamp = -1;        // the timestamp the game queued it with: its queue time, or
+                                   // a reused one
+    nsecs_t engineTimestamp = -1;  // the timestamp the engine's queue gave it; -1: never entered
+    nsecs_t renderDoneTime = -1;   // when its acquire fence signalled
     nsecs_t acquireTime = -1;
     // The first and last present at which the frame carried the larger weight of the picture on
     // screen; -1 when it never did (a dropped frame).

@@ -54,8 +54,10 @@ ul.findings li { margin: 4px 0; }
 table { border-collapse: collapse; font-size: 13px; }
 table.options { max-width: 380px; }
 td, th { padding: 3px 10px; text-align: left; border-bottom: 1px solid #e3e3e3; }
+table.grid td { text-align: right; } td.best { background: #d8f5d0; font-weight: bold; }
 th.section { padding-top: 10px; background: #fafafa; }
 .figures { display: grid; grid-template-columns: 1fr 1fr; gap: 16px; margin-top: 20px; }
+.figures.single { grid-template-columns: 1fr; }
 figure { margin: 0; } figure img { width: 100%; border: 1px solid #ddd; }
 figcaption { font-size: 13px; color: #444; }
 )";
@@ -109,44 +111,83 @@ Status drawFigures(const std::string& folder) {
     return {errorLine("figures incomplete: " + script + " failed")};
 }
 
-Status writeReport(const std::string& folder,
-                   const std::vector<std::pair<std::string, std::string>>& options,
+ReportPage runPage(const std::vector<std::pair<std::string, std::string>>& options,
                    const Summary& run, const Summary* reference) {
+    ReportPage page;
+    page.heading = std::string("verolux-sim: ") + modeName(run.facts.mode) + " (mode " +
+                   std::to_string(run.facts.mode) + ")" +
+                   (reference != nullptr ? " against no interpolation (mode 2)" : "");
+    page.findings = findings(run, reference);
+    page.options = options;
+    page.table = summaryRows(runColumns(run, reference));
+    page.ledger = ledgerLines({&run, reference});
+    page.figures = figures();
+    return page;
+}
+
+namespace {
+
+void writeTable(std::ostream& out, const std::vector<SummaryRow>& rows) {
+    out << "<table>\n";
+    for (const SummaryRow& row : rows) {
+        const char* cell = row.section ? "th class=\"section\"" : "td";
+        const char* end = row.section ? "th" : "td";
+        out << "<tr><" << cell << ">" << html(row.label) << "</" << end << ">";
+        for (const std::string& value : row.values)
+            out << "<" << cell << ">" << html(value) << "</" << end << ">";
+        out << "</tr>\n";
+    }
+    out << "</table>\n";
+}
+
+void writeGrid(std::ostream& out, const ReportGrid& grid) {
+    out << "<h2>" << html(grid.title) << "</h2>\n<table class=\"grid\"><tr><th>"
+        << html(grid.corner) << "</th>";
+    for (const std::string& label : grid.columnLabels)
+        out << "<th>" << html(label) << "</th>";
+    out << "</tr>\n";
+    for (size_t r = 0; r < grid.rowLabels.size(); r++) {
+        out << "<tr><th>" << html(grid.rowLabels[r]) << "</th>";
+        for (size_t c = 0; c < grid.cells[r].size(); c++) {
+            out << (grid.marked[r][c] ? "<td class=\"best\">" : "<td>") << html(grid.cells[r][c])
+                << "</td>";
+        }
+        out << "</tr>\n";
+    }
+    out << "</table>\n";
+}
+
+}  // namespace
+
+Status writeReport(const std::string& folder, const ReportPage& page) {
     const std::string path = (std::filesystem::path(folder) / "report.html").string();
     std::ofstream out(path, std::ios::binary | std::ios::trunc);
     if (!out) return {errorLine("cannot write " + path + ": " + strerror(errno))};
     out << "<!DOCTYPE html>\n<html><head><meta charset=\"utf-8\"><title>verolux-sim report</title>"
-        << "<style>" << STYLE
-        << "</style></head><body>\n<h1>verolux-sim: " << html(modeName(run.facts.mode)) << " (mode "
-        << run.facts.mode << ")";
-    if (reference != nullptr) out << " against no interpolation (mode 2)";
-    out << "</h1>\n<ul class=\"findings\">\n";
-    for (const std::string& line : findings(run, reference))
+        << "<style>" << STYLE << "</style></head><body>\n<h1>" << html(page.heading)
+        << "</h1>\n<ul class=\"findings\">\n";
+    for (const std::string& line : page.findings)
         out << "<li>" << html(line) << "</li>\n";
-    out << "</ul>\n<div class=\"tables\">\n<table class=\"options\"><tr><th colspan=\"2\" "
-           "class=\"section\">Options"
-           "</th></tr>\n";
-    for (const auto& [name, value] : options)
-        out << "<tr><td>" << html(name) << "</td><td>" << html(value) << "</td></tr>\n";
-    out << "</table>\n<table>\n";
-    for (const SummaryRow& row : summaryRows(run, reference)) {
-        if (row.section) {
-            out << "<tr><th class=\"section\">" << html(row.label) << "</th><th class=\"section\">"
-                << html(row.run) << "</th>";
-            if (reference != nullptr)
-                out << "<th class=\"section\">" << html(row.reference) << "</th>";
-            out << "</tr>\n";
-            continue;
-        }
-        out << "<tr><td>" << html(row.label) << "</td><td>" << html(row.run) << "</td>";
-        if (reference != nullptr) out << "<td>" << html(row.reference) << "</td>";
-        out << "</tr>\n";
+    out << "</ul>\n";
+    if (!page.expectations.empty()) {
+        out << "<h2>Expectations</h2>\n<pre>";
+        for (const std::string& line : page.expectations)
+            out << html(line) << "\n";
+        out << "</pre>\n";
     }
-    out << "</table>\n</div>\n<h2>Watchdog warnings</h2>\n<pre>";
-    for (const std::string& line : ledgerLines(run, reference))
+    for (const ReportGrid& grid : page.grids)
+        writeGrid(out, grid);
+    out << "<div class=\"tables\">\n<table class=\"options\"><tr><th colspan=\"2\" "
+           "class=\"section\">Options</th></tr>\n";
+    for (const auto& [name, value] : page.options)
+        out << "<tr><td>" << html(name) << "</td><td>" << html(value) << "</td></tr>\n";
+    out << "</table>\n";
+    writeTable(out, page.table);
+    out << "</div>\n<h2>Watchdog warnings</h2>\n<pre>";
+    for (const std::string& line : page.ledger)
         out << html(line) << "\n";
-    out << "</pre>\n<div class=\"figures\">\n";
-    for (const Figure& figure : figures()) {
+    out << "</pre>\n<div class=\"figures" << (page.figures.size() == 1 ? " single" : "") << "\">\n";
+    for (const Figure& figure : page.figures) {
         if (!std::filesystem::exists(std::filesystem::path(folder) / figure.file)) continue;
         out << "<figure><img src=\"" << figure.file << "\" alt=\"" << figure.file
             << "\"><figcaption>" << html(figure.caption) << "</figcaption></figure>\n";

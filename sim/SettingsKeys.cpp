@@ -15,6 +15,7 @@
 #include <type_traits>
 #include <variant>
 
+#include "sim/JsonDocument.h"
 #include "sim/TextNumbers.h"
 
 namespace verolux::sim {
@@ -25,18 +26,10 @@ using host::SettingValue;
 using Points = std::vector<SettingValue::Point>;
 
 // A settings file is a handful of lines; anything this big is the wrong file.
-constexpr std::streamoff MAX_SETTINGS_FILE_BYTES = 1 << 20;
+constexpr size_t MAX_SETTINGS_FILE_BYTES = 1 << 20;
 constexpr int32_t MODE_ID = 7;
 constexpr int64_t MAX_MODE = 5;
 constexpr int MAX_SETTINGS_DEPTH = 16;
-constexpr size_t MAX_JSON_ERROR_CHARS = 100;
-
-std::string describe(const Json::Value& value) {
-    if (value.isString()) return quoted(value.asString());
-    Json::StreamWriterBuilder builder;
-    builder["indentation"] = "";
-    return quoted(Json::writeString(builder, value));
-}
 
 // Each check returns the reason a value is refused, or an empty string; the got text is already
 // quoted for the message.
@@ -174,22 +167,17 @@ std::string valueFromText(const SettingKey& key, std::string_view text, SettingV
     return expected(key, got);
 }
 
-bool isNumber(const Json::Value& value) {
-    return value.type() == Json::intValue || value.type() == Json::uintValue ||
-           value.type() == Json::realValue;
-}
-
 std::string valueFromJson(const SettingKey& key, const Json::Value& json, SettingValue::Value& out) {
-    const std::string got = describe(json);
+    const std::string got = describeJson(json);
     switch (key.type) {
         case SettingType::INT:
             if (json.isInt64()) return checkInt(key, json.asInt64(), got, out);
-            if (isNumber(json) && std::floor(json.asDouble()) == json.asDouble()) {
+            if (isJsonNumber(json) && std::floor(json.asDouble()) == json.asDouble()) {
                 return std::string(key.name) + " is out of range (got " + got + ")";
             }
             break;
         case SettingType::FLOAT:
-            if (isNumber(json)) {
+            if (isJsonNumber(json)) {
                 float f = 0;
                 std::string error = checkFloat(key, json.asDouble(), got, f);
                 if (error.empty()) out = f;
@@ -201,7 +189,7 @@ std::string valueFromJson(const SettingKey& key, const Json::Value& json, Settin
                 out = json.asBool();
                 return {};
             }
-            if (isNumber(json) && (json.asDouble() == 0 || json.asDouble() == 1)) {
+            if (isJsonNumber(json) && (json.asDouble() == 0 || json.asDouble() == 1)) {
                 out = json.asDouble() == 1;
                 return {};
             }
@@ -210,36 +198,21 @@ std::string valueFromJson(const SettingKey& key, const Json::Value& json, Settin
             if (!json.isArray()) break;
             std::vector<double> flat;
             for (const Json::Value& item : json) {
-                if (isNumber(item)) {
+                if (isJsonNumber(item)) {
                     flat.push_back(item.asDouble());
-                } else if (item.isArray() && item.size() == 2 && isNumber(item[0]) &&
-                           isNumber(item[1])) {
+                } else if (item.isArray() && item.size() == 2 && isJsonNumber(item[0]) &&
+                           isJsonNumber(item[1])) {
                     flat.push_back(item[0].asDouble());
                     flat.push_back(item[1].asDouble());
                 } else {
                     return std::string(key.name) + " expects numbers or [x, y] pairs (got " +
-                           describe(item) + ")";
+                           describeJson(item) + ")";
                 }
             }
             return checkPoints(key, flat, got, out);
         }
     }
     return expected(key, got);
-}
-
-// jsoncpp reports "* Line 3, Column 5\n  Missing ',' or '}' in object declaration\n" per error;
-// keep the first one, on one short line: jsoncpp quotes the offending text whole ("'1e999...' is
-// not a number.", "Duplicate key: '...'").
-std::string firstJsonError(const std::string& errors) {
-    std::istringstream lines(errors);
-    std::string where;
-    std::string what;
-    std::getline(lines, where);
-    std::getline(lines, what);
-    where = std::string(trim(where));
-    if (where.rfind("* ", 0) == 0) where.erase(0, 2);
-    what = std::string(trim(what));
-    return printable(what.empty() ? where : where + ": " + what, MAX_JSON_ERROR_CHARS);
 }
 
 }  // namespace
@@ -307,63 +280,36 @@ Result<SettingValue> parseSettingAssignment(std::string_view assignment) {
     return result;
 }
 
-Result<std::vector<SettingValue>> parseSettingsJson(std::string_view text, std::string_view source) {
+Result<std::vector<SettingValue>> settingsFromJson(const Json::Value& object,
+                                                   std::string_view where) {
     using R = Result<std::vector<SettingValue>>;
-    const std::string prefix = std::string(source) + ": ";
-    Json::CharReaderBuilder builder;
-    Json::CharReaderBuilder::strictMode(&builder.settings_);
-    builder["allowComments"] = true;
-    // Settings nest three levels at most (object, curve, point).
-    builder["stackLimit"] = MAX_SETTINGS_DEPTH;
-    const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
-    Json::Value root;
-    std::string errors;
-    bool parsed = false;
-    try {
-        parsed = reader->parse(text.data(), text.data() + text.size(), &root, &errors);
-    } catch (const Json::Exception&) {
-        // The reader throws instead of reporting when the nesting exceeds its stack limit.
-        return R::failure(errorLine(prefix + "invalid JSON: nested deeper than " +
-                                    std::to_string(MAX_SETTINGS_DEPTH) + " levels"));
-    }
-    if (!parsed) {
-        return R::failure(errorLine(prefix + "invalid JSON: " + firstJsonError(errors)));
-    }
-    if (!root.isObject()) {
+    const std::string prefix = std::string(where) + ": ";
+    if (!object.isObject()) {
         return R::failure(errorLine(prefix + "expected an object of settings keys"));
     }
     R result;
-    for (const std::string& name : root.getMemberNames()) {
+    for (const std::string& name : object.getMemberNames()) {
         const SettingKey* key = findSettingKey(name);
-        if (key == nullptr) {
-            return R::failure(errorLine(prefix + unknownKey(name)));
-        }
+        if (key == nullptr) return R::failure(errorLine(prefix + unknownKey(name)));
         SettingValue entry{key->id, {}};
-        std::string error = valueFromJson(*key, root[name], entry.value);
+        std::string error = valueFromJson(*key, object[name], entry.value);
         if (!error.empty()) return R::failure(errorLine(prefix + error));
         result.value.push_back(std::move(entry));
     }
     return result;
 }
 
+Result<std::vector<SettingValue>> parseSettingsJson(std::string_view text, std::string_view source) {
+    // Settings nest three levels at most (object, curve, point).
+    const Result<Json::Value> root = parseJsonDocument(text, source, MAX_SETTINGS_DEPTH);
+    if (!root.ok()) return Result<std::vector<SettingValue>>::failure(root.error);
+    return settingsFromJson(root.value, source);
+}
+
 Result<std::vector<SettingValue>> readSettingsFile(const std::string& path) {
-    using R = Result<std::vector<SettingValue>>;
-    std::ifstream in(path, std::ios::binary);
-    if (!in) {
-        return R::failure(errorLine("cannot read settings file " + path + ": " + strerror(errno)));
-    }
-    std::ostringstream text;
-    char buffer[4096];
-    std::streamoff total = 0;
-    while (in.read(buffer, sizeof(buffer)) || in.gcount() > 0) {
-        total += in.gcount();
-        if (total > MAX_SETTINGS_FILE_BYTES) {
-            return R::failure(errorLine(path + ": larger than 1 MiB, not a settings file"));
-        }
-        text.write(buffer, in.gcount());
-    }
-    if (in.bad()) return R::failure(errorLine("cannot read settings file " + path));
-    return parseSettingsJson(text.str(), path);
+    const Result<std::string> text = readSmallFile(path, MAX_SETTINGS_FILE_BYTES, "settings file");
+    if (!text.ok()) return Result<std::vector<SettingValue>>::failure(text.error);
+    return parseSettingsJson(text.value, path);
 }
 
 int32_t logLevelOf(const std::vector<SettingValue>& settings) {

@@ -5,6 +5,8 @@
 #include <string_view>
 #include <vector>
 
+#include <json/value.h>
+
 #include "host/SettingsMessage.h"
 #include "sim/Result.h"
 
@@ -34,6 +36,9 @@ Result<host::SettingValue> parseSettingAssignment(std::string_view assignment);
 Result<std::vector<host::SettingValue>> parseSettingsJson(std::string_view text,
                                                           std::string_view source);
 Result<std::vector<host::SettingValue>> readSettingsFile(const std::string& path);
+// The same from an object already read; `where` names it in error lines ("FILE: deliveries[0]").
+Result<std::vector<host::SettingValue>> settingsFromJson(const Json::Value& object,
+                                                         std::string_view where);
 
 // The logLevel these settings leave the library at (0 when they do not set it).
 int32_t logLevelOf(const std::vector<host::SettingValue>& settings);

@@ -25,6 +25,7 @@
 #include "sim/LayerRecorder.h"
 #include "sim/Outputs.h"
 #include "sim/RecordQueue.h"
+#include "sim/Scenario.h"
 #include "sim/WarningLedger.h"
 
 namespace verolux::sim {
@@ -142,7 +143,14 @@ struct Simulation::Layer {
 class Simulation::SimulatedTimeLoop final : public FenceScheduler {
 public:
     struct Event {
-        enum class Kind : uint8_t { VSYNC, FRAME_START, RENDER_DONE, RELEASE, READ_WARNINGS };
+        enum class Kind : uint8_t {
+            VSYNC,
+            FRAME_START,
+            RENDER_DONE,
+            RELEASE,
+            READ_WARNINGS,
+            SCENARIO,
+        };
 
         explicit Event(Kind kind, size_t layer = 0, uint64_t generation = 0,
                        android::sp<android::Fence> fence = nullptr)
@@ -153,7 +161,8 @@ public:
 
         Kind kind;
         uint32_t layer;
-        uint64_t generation;  // RELEASE: the wait it ends, stale once the layer moved on
+        // RELEASE: the wait it ends, stale once the layer moved on; SCENARIO: the change's index.
+        uint64_t generation;
         android::sp<android::Fence> fence;
     };
 
@@ -175,12 +184,23 @@ private:
         uint64_t eventsSeen = 0;
     };
 
+    // One of a scenario's changes, at its time.
+    struct ScenarioChange {
+        enum class Kind : uint8_t { DISPLAY_RATE, CLIENT_SHARE, SETTINGS };
+        nsecs_t time;
+        Kind kind;
+        double value;  // the rate in Hz, or the share
+        const std::vector<host::SettingValue>* settings;
+    };
+
     // More decisions than frames a queue can hold, at one time, is a policy that never waits.
     static constexpr int MAX_DECISIONS_AT_ONCE = 72;
     static constexpr int MAX_SETTLING_ROUNDS = 1000;
 
     void push(nsecs_t time, Event event) { mEvents.push(std::max(time, mNow), std::move(event)); }
+    void scheduleScenario();
     void play(Event& event, Compositor& compositor);
+    void change(const ScenarioChange& change, Compositor& compositor);
     void settle();
     // Lets the layer's release side decide again when it waits and an event it decides on came.
     bool decideIfWoken(size_t layer);
@@ -196,6 +216,10 @@ private:
     std::vector<ReleaseSide> mRelease;
     EventQueue<Event> mEvents;
     nsecs_t mNow = 0;
+    double mHz = 0;  // the display's rate, and its period
+    nsecs_t mPeriod = 0;
+    double mPendingHz = 0;  // the display's rate from its next vsync on; 0: no change
+    std::vector<ScenarioChange> mChanges;
 };
 
 void Simulation::SimulatedTimeLoop::run(Compositor& compositor, const std::atomic<bool>& interrupted,
@@ -211,7 +235,10 @@ void Simulation::SimulatedTimeLoop::run(Compositor& compositor, const std::atomi
         push(mLayers[i]->game->nextFrameStart(), Event(Event::Kind::FRAME_START, i));
     }
     compositor.setAfterComposition([this](size_t layer) { decideIfWoken(layer); });
+    mHz = mSimulation.mOptions.hz;
+    mPeriod = mSimulation.mRefreshPeriod;
     push(start, Event(Event::Kind::VSYNC));
+    scheduleScenario();
     push(start + DRAIN_PERIOD, Event(Event::Kind::READ_WARNINGS));
 
     nsecs_t end = this->end(result);
@@ -237,6 +264,46 @@ void Simulation::SimulatedTimeLoop::run(Compositor& compositor, const std::atomi
     if (end != LATEST) mNow = std::max(mNow, end);
     ClockOverride::setNow(mNow);
     result.endTime = mNow;
+    result.displayHz = mHz;
+}
+
+void Simulation::SimulatedTimeLoop::scheduleScenario() {
+    const Scenario* scenario = mSimulation.mScenario;
+    if (scenario == nullptr) return;
+    const nsecs_t start = mSimulation.mStartTime;
+    auto at = [start](double sec) {
+        return start + static_cast<nsecs_t>(std::llround(sec * SECOND));
+    };
+    using Kind = ScenarioChange::Kind;
+    for (const DisplayChange& display : scenario->display)
+        mChanges.push_back({at(display.at), Kind::DISPLAY_RATE, display.hz, nullptr});
+    // At the end of a burst the share goes back to the run's own.
+    for (const ClientCompositionBurst& burst : scenario->clientComposition) {
+        mChanges.push_back({at(burst.from), Kind::CLIENT_SHARE, burst.share, nullptr});
+        mChanges.push_back({at(burst.until), Kind::CLIENT_SHARE,
+                            mSimulation.mOptions.clientCompositionShare, nullptr});
+    }
+    for (const SettingsDelivery& delivery : scenario->deliveries)
+        mChanges.push_back({at(delivery.at), Kind::SETTINGS, 0, &delivery.settings});
+    for (size_t i = 0; i < mChanges.size(); i++)
+        push(mChanges[i].time, Event(Event::Kind::SCENARIO, 0, i));
+}
+
+void Simulation::SimulatedTimeLoop::change(const ScenarioChange& change, Compositor& compositor) {
+    switch (change.kind) {
+        case ScenarioChange::Kind::DISPLAY_RATE:
+            // The vsync already due comes at the old rate; the display runs at the new one after.
+            mPendingHz = change.value;
+            break;
+        case ScenarioChange::Kind::CLIENT_SHARE:
+            compositor.setClientCompositionShare(change.value);
+            break;
+        case ScenarioChange::Kind::SETTINGS:
+            // As the controlling service delivers them: to every layer's game.
+            for (const auto& layer : mLayers)
+                host::deliverSettings(layer->plan.uid, *change.settings);
+            break;
+    }
 }
 
 void Simulation::SimulatedTimeLoop::play(Event& event, Compositor& compositor) {
@@ -244,7 +311,16 @@ void Simulation::SimulatedTimeLoop::play(Event& event, Compositor& compositor) {
     switch (event.kind) {
         case Event::Kind::VSYNC:
             compositor.refresh(mNow);
-            push(mNow + mSimulation.mRefreshPeriod, Event(Event::Kind::VSYNC));
+            if (mPendingHz > 0) {
+                mHz = mPendingHz;
+                mPendingHz = 0;
+                mPeriod = static_cast<nsecs_t>(std::llround(SECOND / mHz));
+                compositor.setRefreshPeriod(mPeriod, mNow + mPeriod);
+            }
+            push(mNow + mPeriod, Event(Event::Kind::VSYNC));
+            break;
+        case Event::Kind::SCENARIO:
+            change(mChanges[event.generation], compositor);
             break;
         case Event::Kind::FRAME_START:
             if (layer.game->tryProduce()) scheduleNextFrame(event.layer);
@@ -351,9 +427,10 @@ void Simulation::SimulatedTimeLoop::reportProgress(
 }
 
 Simulation::Simulation(const Options& options, std::vector<host::SettingValue> settings,
-                       const Capture* capture)
+                       const Capture* capture, const Scenario* scenario)
     : mOptions(options),
       mCapture(capture),
+      mScenario(scenario),
       mRefreshPeriod(static_cast<nsecs_t>(std::llround(SECOND / options.hz))) {
     // Interpolation needs the display delay in front of each frame's display time; the user's own
     // settings come after, so they can still turn it off.
@@ -433,7 +510,10 @@ RunResult Simulation::run(const std::vector<RecordSink*>& sinks,
         layers.push_back(
                 std::make_unique<Layer>(mOptions, mLayers[i], simulated ? sinks[i] : nullptr));
     }
-    // The layers' observers subscribed as they were created; this hands them their settings.
+    // The layers' observers subscribed as they were created; this hands them their settings, and
+    // the recorders hear the display delay the settings set.
+    for (auto& layer : layers)
+        layer->recorder->startListening();
     android::Interpolation::SettingsController::getInstance()->notifyChanges();
 
     std::optional<SimulatedTimeLoop> loop;
@@ -448,11 +528,12 @@ RunResult Simulation::run(const std::vector<RecordSink*>& sinks,
     // stretch of that length, when it ends before the window starts).
     const nsecs_t picturesUntil =
             mStartTime + std::llround(mOptions.pictureAtSec * SECOND) + Outputs::PICTURE_WINDOW;
-    GameConfig gameConfig{mOptions.fps, mOptions.jitterMs, mOptions.renderMs, mOptions.seed,
-                          mCapture,     mOptions.loop,     picturesUntil};
+    GameConfig gameConfig{mOptions.fps,      mOptions.jitterMs,
+                          mOptions.renderMs, mOptions.seed,
+                          mCapture,          mScenario != nullptr ? &mScenario->game : nullptr,
+                          mOptions.loop,     picturesUntil};
     std::vector<DisplayedLayer> displayed;
     for (auto& layer : layers) {
-        layer->recorder->startListening();
         layer->game = std::make_unique<Game>(gameConfig, layer->queue, *layer->layerHost, *fences,
                                              *layer->recorder, mStartTime);
         displayed.push_back({&layer->queue, layer->layerHost.get(), layer->recorder.get()});
@@ -495,7 +576,10 @@ RunResult Simulation::run(const std::vector<RecordSink*>& sinks,
     for (auto& layer : layers)
         layer->layerHost->stop();
     if (gpu) gpu->stop();
-    if (!simulated) result.endTime = std::min(systemTime(SYSTEM_TIME_MONOTONIC), plannedEnd());
+    if (!simulated) {
+        result.endTime = std::min(systemTime(SYSTEM_TIME_MONOTONIC), plannedEnd());
+        result.displayHz = mOptions.hz;
+    }
     for (size_t i = 0; i < layers.size(); i++) {
         Layer& layer = *layers[i];
         layer.recorder->stopListening();

@@ -15,6 +15,7 @@
 namespace verolux::sim {
 
 class Compositor;
+struct Scenario;
 
 // A simulated layer as planned: the game in the chosen mode, the same game in mode 2 beside it,
 // or another copy of the game in the chosen mode.
@@ -28,6 +29,7 @@ struct LayerPlan {
 
 struct RunResult {
     nsecs_t endTime = -1;
+    double displayHz = 0;  // the display's refresh rate at the end
     bool interrupted = false;
     bool captureEnded = false;
     double wallSeconds = 0;  // how long the run took on the wall clock
@@ -48,7 +50,9 @@ struct RunResult {
 // vsync and its composition, a release decision, a reading of the warnings) with the process's
 // clock (ClockOverride) set to each event's time, from SIMULATED_CLOCK_START on; no thread is
 // started and nothing waits. Layers release through LayerHost::stepRelease(), the same decisions
-// as the release thread's.
+// as the release thread's. A scenario's changes are events of that queue too: the display's rate,
+// bursts of client composition, settings delivered to every layer's game; its game segments
+// change the game as it plays (GameScript). Scenarios play in simulated time only.
 //
 // Several runs may follow one another in one process, each as if it were the first: a run resets
 // the library's process-wide state that it would otherwise inherit from the one before (its uids'
@@ -73,7 +77,7 @@ public:
     // later, at startTime(). Unless the settings set gameFpsLimit, it is the refresh rate, so that
     // the layers are interpolated.
     Simulation(const Options& options, std::vector<host::SettingValue> settings,
-               const Capture* capture);
+               const Capture* capture, const Scenario* scenario = nullptr);
 
     const std::vector<LayerPlan>& layers() const { return mLayers; }
     nsecs_t refreshPeriod() const { return mRefreshPeriod; }
@@ -105,6 +109,7 @@ private:
 
     const Options mOptions;
     const Capture* const mCapture;
+    const Scenario* const mScenario;
     const nsecs_t mRefreshPeriod;
     std::vector<LayerPlan> mLayers;
     nsecs_t mInitialDelay = -1;

@@ -191,6 +191,11 @@ const Line LINES[] = {
              return number(s.facts.ownFps, "%.1f") + " fps" + (throttled(s) ? " (held back)" : "");
          }},
         {"game-rate limit first / last / lowest", gameRateLimit},
+        {"frame timestamps",
+         [](const Summary& s) -> std::string {
+             const auto& from = s.measured.clockTimeFrom;
+             return from ? "the engine's clock from " + seconds(s, *from) : "the game's";
+         }},
         {"waited for a free buffer",
          [](const Summary& s) {
              return format("%.0f ms (%.1f %% of the run)", s.measured.bufferWaitMs,
@@ -304,6 +309,22 @@ void warnings(const Summary& s, std::vector<std::string>& out) {
     }
 }
 
+// Notes on the run as a whole, which its layers share.
+void runNotes(const Summary& s, std::vector<std::string>& out) {
+    if (s.facts.captureEnded) {
+        out.push_back(
+                format("Note: the run stopped at the end of its capture, after %.2f s "
+                       "(--loop replays it).",
+                       s.facts.runSec));
+    }
+    if (s.facts.refreshRateChanged) {
+        out.push_back(
+                "Note: the display changed its refresh rate during the run: stutters are gaps "
+                "over 1.5 x the median gap of the whole run, so a stretch at a slower rate "
+                "counts its gaps as stutters.");
+    }
+}
+
 }  // namespace
 
 const char* modeName(uint32_t mode) {
@@ -320,14 +341,13 @@ bool throttled(const Summary& summary) {
            !summary.measured.gameRateLimitAppliedFrom;
 }
 
-std::vector<std::string> ledgerLines(const Summary& run, const Summary* reference) {
+std::vector<std::string> ledgerLines(const std::vector<const Summary*>& layers) {
     std::vector<std::pair<nsecs_t, std::string>> lines;
     uint64_t unlisted = 0;
-    for (const Summary* s : {&run, reference}) {
+    for (const Summary* s : layers) {
         if (s == nullptr) continue;
         for (const WarningRecord& warning : s->measured.warnings)
-            lines.emplace_back(warning.time,
-                               ledgerLine(warning, run.facts.startTime, s->facts.role));
+            lines.emplace_back(warning.time, ledgerLine(warning, s->facts.startTime, s->facts.role));
         unlisted += s->measured.warningCount - s->measured.warnings.size();
     }
     std::stable_sort(lines.begin(), lines.end(),
@@ -340,18 +360,54 @@ std::vector<std::string> ledgerLines(const Summary& run, const Summary* referenc
     return out;
 }
 
-std::vector<SummaryRow> summaryRows(const Summary& run, const Summary* reference) {
+std::vector<SummaryColumn> runColumns(const Summary& run, const Summary* reference) {
+    std::vector<SummaryColumn> columns = {{title(run), &run}};
+    if (reference != nullptr) columns.push_back({title(*reference), reference});
+    return columns;
+}
+
+std::vector<SummaryRow> summaryRows(const std::vector<SummaryColumn>& columns) {
     std::vector<SummaryRow> rows;
-    rows.push_back({"", title(run), reference != nullptr ? title(*reference) : "", true});
+    SummaryRow& titles = rows.emplace_back();
+    titles.section = true;
+    for (const SummaryColumn& column : columns)
+        titles.values.push_back(column.title);
     for (const Line& line : LINES) {
-        if (line.value == nullptr) {
-            rows.push_back({line.label, "", "", true});
-            continue;
-        }
-        rows.push_back(
-                {line.label, line.value(run), reference != nullptr ? line.value(*reference) : ""});
+        SummaryRow& row = rows.emplace_back();
+        row.label = line.label;
+        row.section = line.value == nullptr;
+        for (const SummaryColumn& column : columns)
+            row.values.push_back(row.section ? "" : line.value(*column.summary));
     }
     return rows;
+}
+
+std::string formatTable(const std::vector<SummaryRow>& rows, size_t minWidth) {
+    std::vector<size_t> widths;
+    for (const SummaryRow& row : rows) {
+        widths.resize(std::max(widths.size(), row.values.size()), minWidth);
+        for (size_t i = 0; i < row.values.size(); i++)
+            widths[i] = std::max(widths[i], row.values[i].size() + 2);
+    }
+    std::string out;
+    for (const SummaryRow& row : rows) {
+        const bool titleOnly = row.section && !row.label.empty();
+        std::string line = titleOnly ? row.label : format("  %-37s", row.label.c_str());
+        for (size_t i = 0; i < row.values.size() && !titleOnly; i++) {
+            line += " " + row.values[i] + std::string(widths[i] - row.values[i].size() - 1, ' ');
+        }
+        while (!line.empty() && line.back() == ' ')
+            line.pop_back();
+        out += line + "\n";
+    }
+    return out;
+}
+
+std::string summaryValue(const Summary& summary, std::string_view label) {
+    for (const Line& line : LINES) {
+        if (line.value != nullptr && label == line.label) return line.value(summary);
+    }
+    return {};
 }
 
 std::vector<std::string> findings(const Summary& run, const Summary* reference) {
@@ -362,11 +418,25 @@ std::vector<std::string> findings(const Summary& run, const Summary* reference) 
     }
     warnings(run, out);
     if (reference != nullptr) warnings(*reference, out);
-    if (run.facts.captureEnded) {
+    runNotes(run, out);
+    return out;
+}
+
+std::vector<std::string> comparisonFindings(const std::vector<SummaryColumn>& columns,
+                                            const Summary* baseline) {
+    std::vector<std::string> out;
+    for (const SummaryColumn& column : columns) {
+        if (baseline == nullptr || column.summary == baseline) continue;
+        out.push_back(column.title + ": " + motionFinding(*column.summary, *baseline));
+        out.push_back(column.title + ": " + costFinding(*column.summary, *baseline));
+    }
+    for (const SummaryColumn& column : columns)
+        warnings(*column.summary, out);
+    if (!columns.empty() && columns.front().summary->facts.captureEnded) {
         out.push_back(
-                format("Note: the run stopped at the end of its capture, after %.2f s "
+                format("Note: the runs stopped at the end of their capture, after %.2f s "
                        "(--loop replays it).",
-                       run.facts.runSec));
+                       columns.front().summary->facts.runSec));
     }
     return out;
 }
@@ -376,22 +446,11 @@ std::string formatSummary(const Summary& run, const Summary* reference) {
     for (const std::string& line : findings(run, reference))
         out += line + "\n";
     if (!out.empty()) out += "\n";
-    for (const SummaryRow& row : summaryRows(run, reference)) {
-        std::string line;
-        if (row.section && row.run.empty()) {
-            line = row.label;
-        } else if (reference == nullptr) {
-            line = format("  %-37s %s", row.label.c_str(), row.run.c_str());
-        } else {
-            line = format("  %-37s %-36s %s", row.label.c_str(), row.run.c_str(),
-                          row.reference.c_str());
-        }
-        while (!line.empty() && line.back() == ' ')
-            line.pop_back();
-        out += line + "\n";
-    }
+    // Columns as wide as the widest value of a summary, so that runs line up whatever they show.
+    constexpr size_t COLUMN_WIDTH = 37;
+    out += formatTable(summaryRows(runColumns(run, reference)), COLUMN_WIDTH);
     out += "Watchdog warnings: time in the run, time of day, game, code, value\n";
-    for (const std::string& line : ledgerLines(run, reference))
+    for (const std::string& line : ledgerLines({&run, reference}))
         out += "  " + line + "\n";
     return out;
 }

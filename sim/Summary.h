@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "sim/Measures.h"
@@ -23,6 +24,7 @@ struct LayerFacts {
     double refreshHz = 0;                 // the display's true refresh rate
     nsecs_t startTime = 0;                // stutter times count from here
     bool captureEnded = false;            // the run stopped because its capture ran out
+    bool refreshRateChanged = false;      // the display changed its rate during the run
     TimeMode time = TimeMode::SIMULATED;  // how the run kept time
 };
 
@@ -36,27 +38,48 @@ constexpr double THROTTLE_SHARE = 0.98;
 
 bool throttled(const Summary& summary);
 
-// One line of the summary table: a section title (no values) or a measure with the run's value
-// and the reference's.
+// A column of the summary table: a layer's summary under a title.
+struct SummaryColumn {
+    std::string title;
+    const Summary* summary;
+};
+
+// The run, and the reference beside it when there is one, under their titles ("run: mode 0
+// retime").
+std::vector<SummaryColumn> runColumns(const Summary& run, const Summary* reference);
+
+// One line of the summary table: the titles (first, as a section), a section title (no values) or
+// a measure with a value per column.
 struct SummaryRow {
     std::string label;
-    std::string run;
-    std::string reference;
+    std::vector<std::string> values;
     bool section = false;
 };
 
-std::vector<SummaryRow> summaryRows(const Summary& run, const Summary* reference);
+std::vector<SummaryRow> summaryRows(const std::vector<SummaryColumn>& columns);
+
+// The table as text: the labels, then each column as wide as its widest value and two spaces, and
+// at least `minWidth`.
+std::string formatTable(const std::vector<SummaryRow>& rows, size_t minWidth);
+
+// A measure of the table as the table gives it, by its row's label; empty for no such row.
+std::string summaryValue(const Summary& summary, std::string_view label);
 
 // Plain sentences above the table: whether interpolation made the motion smoother and what it
 // cost, then warnings about the run itself (a held-back game, skipped vsyncs).
 std::vector<std::string> findings(const Summary& run, const Summary* reference);
 
+// The same for runs of one game side by side: each run's motion and cost against the baseline's
+// (when there is one; its own column is not compared), then each one's notes and warnings.
+std::vector<std::string> comparisonFindings(const std::vector<SummaryColumn>& columns,
+                                            const Summary* baseline);
+
 // The name of an interpolation mode: "retime" for 0, ... "latency reduction" for 5.
 const char* modeName(uint32_t mode);
 
-// The watchdog warnings of both layers in time order, one line each ("none" when there were none),
-// as the settings client read them back.
-std::vector<std::string> ledgerLines(const Summary& run, const Summary* reference);
+// The watchdog warnings of the layers in time order, one line each ("none" when there were none),
+// as the settings client read them back; each names its layer by its role.
+std::vector<std::string> ledgerLines(const std::vector<const Summary*>& layers);
 
 // The findings, a blank line, the table with the reference in a second column, and the ledger of
 // watchdog warnings.

@@ -30,4 +30,15 @@ std::string_view trim(std::string_view text) {
     return text.substr(first, text.find_last_not_of(SPACE) - first + 1);
 }
 
+std::vector<std::string_view> splitAtCommas(std::string_view text) {
+    std::vector<std::string_view> items;
+    size_t start = 0;
+    while (true) {
+        const size_t comma = text.find(',', start);
+        items.push_back(trim(text.substr(start, comma - start)));
+        if (comma == std::string_view::npos) return items;
+        start = comma + 1;
+    }
+}
+
 }  // namespace verolux::sim

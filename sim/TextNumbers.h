@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <optional>
 #include <string_view>
+#include <vector>
 
 namespace verolux::sim {
 
@@ -13,5 +14,8 @@ std::optional<double> parseNumber(std::string_view text);
 
 // The text without leading and trailing spaces, tabs and carriage returns.
 std::string_view trim(std::string_view text);
+
+// The comma-separated items of the text (a CSV line's cells, an option's list), each trimmed.
+std::vector<std::string_view> splitAtCommas(std::string_view text);
 
 }  // namespace verolux::sim

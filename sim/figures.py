@@ -5,7 +5,9 @@ Usage: figures.py FOLDER
 
 Reads run.json, [reference-]frames.csv, [reference-]refreshes.csv and [reference-]spacetime-rows.png,
 and writes frame-times.png, animation-error.png, latency.png, delay.png and spacetime.png beside
-them. The measures follow the README's definitions, as the simulator's summary does.
+them. The folder of a comparison (--compare) holds a run.json whose layers are the modes' runs in
+subfolders; for it, one figure, comparison.png, sets their animation error and latency side by
+side. The measures follow the README's definitions, as the simulator's summary does.
 Exits with status 3, printing nothing, when matplotlib is missing.
 """
 
@@ -26,6 +28,8 @@ except ImportError:
 NS_PER_MS = 1e6
 NS_PER_S = 1e9
 COLOURS = {"run": "#1f5fbf", "reference": "#e07b00"}
+# The runs of a comparison, in order.
+PALETTE = ["#1f5fbf", "#e07b00", "#2a9d3a", "#c0392b", "#7b4fbf", "#8c6d31"]
 PICTURE_COLOURS = {"blend": "#2870ff", "new": "#28c846", "repeat": "#e62828", "held": "#000000"}
 PICTURE_CODES = {name: code for code, name in enumerate(PICTURE_COLOURS)}
 DPI = 100
@@ -76,7 +80,7 @@ def thin(x, y):
 
 
 class Layer:
-    def __init__(self, folder, entry):
+    def __init__(self, folder, entry, index=0):
         self.role = entry["role"]
         self.title = entry["title"]
         self.prefix = entry["prefix"]
@@ -87,7 +91,7 @@ class Layer:
                                       ["refresh", "present_ns", "picture", "content_ns", "delay_ns"],
                                       optional=("content_ns", "delay_ns"))
         self.rows_png = os.path.join(folder, self.prefix + "spacetime-rows.png")
-        self.colour = COLOURS.get(self.role, "#555555")
+        self.colour = COLOURS.get(self.role, PALETTE[index % len(PALETTE)])
 
     def game_frame_times(self):
         """(queue time in s, time since the previous queued frame in ms)."""
@@ -162,6 +166,12 @@ def frame_times(folder, layers):
 
 def animation_error(folder, layers, period_ms):
     fig, ax = plt.subplots(figsize=(10, 5))
+    draw_animation_error(ax, layers, period_ms)
+    fig.tight_layout()
+    save(fig, folder, "animation-error.png")
+
+
+def draw_animation_error(ax, layers, period_ms):
     errors = [(layer, layer.animation_errors()) for layer in layers]
     top = max([nearest_rank(e, 99.9) or 0 for _, e in errors] + [period_ms]) * 1.2
     bins = np.linspace(0, top, 80)
@@ -182,8 +192,6 @@ def animation_error(folder, layers, period_ms):
                  "(0 is perfectly smooth)")
     ax.grid(alpha=0.3)
     ax.legend(fontsize=8)
-    fig.tight_layout()
-    save(fig, folder, "animation-error.png")
 
 
 def cdf(ax, values, layer, unit):
@@ -202,22 +210,42 @@ def cdf(ax, values, layer, unit):
 
 def latency(folder, layers):
     fig, axes = plt.subplots(1, 2, figsize=(12, 5))
+    draw_latency(axes[0], layers)
     for layer in layers:
-        cdf(axes[0], layer.latencies(), layer, "ms")
         cdf(axes[1], layer.content_ages(), layer, "ms")
-    axes[0].set_title("Latency: queue to the first present where the frame leads")
-    axes[0].set_xlabel("latency per frame (ms)")
-    axes[0].set_ylabel("share of frames at or below (%)")
     axes[1].set_title("Content age: present time minus the game time shown")
     axes[1].set_xlabel("content age per refresh (ms)")
     axes[1].set_ylabel("share of refreshes at or below (%)")
-    for ax in axes:
-        ax.set_ylim(0, 100)
-        ax.set_xlim(left=0)
-        ax.grid(alpha=0.3)
-        ax.legend(fontsize=8, loc="lower right")
+    cdf_axes(axes[1])
     fig.tight_layout()
     save(fig, folder, "latency.png")
+
+
+def draw_latency(ax, layers):
+    for layer in layers:
+        cdf(ax, layer.latencies(), layer, "ms")
+    ax.set_title("Latency: queue to the first present where the frame leads")
+    ax.set_xlabel("latency per frame (ms)")
+    ax.set_ylabel("share of frames at or below (%)")
+    cdf_axes(ax)
+
+
+def cdf_axes(ax):
+    ax.set_ylim(0, 100)
+    ax.set_xlim(left=0)
+    ax.grid(alpha=0.3)
+    ax.legend(fontsize=8, loc="lower right")
+
+
+def comparison(folder, layers, period_ms):
+    """One figure for the runs of a comparison: what costs seconds is matplotlib's start and each
+    figure drawn, so the comparison draws one."""
+    fig, axes = plt.subplots(1, 2, figsize=(15, 5.5))
+    draw_animation_error(axes[0], layers, period_ms)
+    axes[0].set_title("Animation error per refresh (0 is perfectly smooth)")
+    draw_latency(axes[1], layers)
+    fig.tight_layout()
+    save(fig, folder, "comparison.png")
 
 
 def delay(folder, layers):
@@ -318,8 +346,11 @@ def main():
     folder = sys.argv[1]
     with open(os.path.join(folder, "run.json")) as f:
         run = json.load(f)
-    layers = [Layer(folder, entry) for entry in run["layers"]]
+    layers = [Layer(folder, entry, i) for i, entry in enumerate(run["layers"])]
     period_ms = run["refresh_period_ns"] / NS_PER_MS
+    if run.get("comparison"):
+        comparison(folder, layers, period_ms)
+        return 0
     frame_times(folder, layers)
     animation_error(folder, layers, period_ms)
     latency(folder, layers)

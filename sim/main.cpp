@@ -10,10 +10,14 @@
 #include <string>
 
 #include "sim/Capture.h"
+#include "sim/Comparison.h"
+#include "sim/Expectations.h"
 #include "sim/FolderRun.h"
 #include "sim/Options.h"
 #include "sim/Report.h"
+#include "sim/Scenario.h"
 #include "sim/SettingsKeys.h"
+#include "sim/Sweep.h"
 
 namespace {
 
@@ -41,15 +45,25 @@ int fail(const std::string& errorLine) {
 }  // namespace
 
 int main(int argc, char** argv) {
-    const Result<Options> parsed = parseOptions(argc, argv);
+    Result<Options> parsed = parseOptions(argc, argv);
     if (!parsed.ok()) return fail(parsed.error);
-    const Options& options = parsed.value;
+    Options& options = parsed.value;
     if (options.help) {
         std::cout << usage();
         return 0;
     }
 
-    const Result<std::vector<verolux::host::SettingValue>> settings = gatherSettings(options);
+    std::optional<Scenario> scenario;
+    if (!options.scenario.empty()) {
+        Result<Scenario> read = readScenario(options.scenario);
+        if (!read.ok()) return fail(read.error);
+        scenario = std::move(read.value);
+        if (const Status applied = applyScenario(*scenario, options); !applied.ok()) {
+            return fail(applied.error);
+        }
+    }
+    const Result<std::vector<verolux::host::SettingValue>> settings = gatherSettings(
+            options, scenario ? scenario->settings : std::vector<verolux::host::SettingValue>{});
     if (!settings.ok()) return fail(settings.error);
 
     std::optional<Capture> capture;
@@ -60,9 +74,16 @@ int main(int argc, char** argv) {
     }
 
     installInterruptHandler();
-    const Result<FolderRun> ran =
-            runIntoFolder(options, settings.value, capture ? &*capture : nullptr, sInterrupted,
-                          options.quiet ? nullptr : &std::cerr);
+    const Capture* game = capture ? &*capture : nullptr;
+    const Scenario* played = scenario ? &*scenario : nullptr;
+    if (!options.compare.empty()) {
+        return compareModes(options, settings.value, game, played, sInterrupted);
+    }
+    if (!options.sweep.empty()) {
+        return sweepSettings(options, settings.value, game, played, sInterrupted);
+    }
+    const Result<FolderRun> ran = runIntoFolder(options, settings.value, game, sInterrupted,
+                                                options.quiet ? nullptr : &std::cerr, played);
     if (!ran.ok()) return fail(ran.error);
     const FolderRun& run = ran.value;
     int status = run.result.interrupted ? 130 : 0;
@@ -78,11 +99,21 @@ int main(int argc, char** argv) {
         std::cout << "Interrupted: results cover the run so far.\n";
     }
     if (!options.quiet) std::cout << run.summaryText << std::flush;
+    for (const CheckedExpectation& checked : run.expectations) {
+        if (checked.passed) continue;
+        if (options.quiet) std::cout << checked.line << "\n";
+        status = status == 0 ? 1 : status;
+    }
 
-    if (!options.quiet) std::cerr << "verolux-sim: drawing the figures..." << std::endl;
-    const Status drawn = drawFigures(options.outDir);
-    if (!drawn.ok()) std::cerr << drawn.error << std::endl;
-    check(writeReport(options.outDir, run.described, run.run(), run.reference()));
+    if (options.figures) {
+        if (!options.quiet) std::cerr << "verolux-sim: drawing the figures..." << std::endl;
+        const Status drawn = drawFigures(options.outDir);
+        if (!drawn.ok()) std::cerr << drawn.error << std::endl;
+    }
+    ReportPage page = runPage(run.described, run.run(), run.reference());
+    for (const CheckedExpectation& checked : run.expectations)
+        page.expectations.push_back(checked.line);
+    check(writeReport(options.outDir, page));
 
     if (options.quiet) return status;
     rusage usage{};

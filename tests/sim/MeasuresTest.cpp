@@ -118,7 +118,7 @@ TEST(LayerRecorderTest, namesWhatTheScreenShowedAndPassesFramesOnInOrder) {
     const android::sp<LayerRecorder> recorder = new LayerRecorder(1, sink);
     for (uint64_t n = 1; n <= 3; n++) {
         recorder->frameDequeued(n, static_cast<int>(n), 1000 * static_cast<nsecs_t>(n), 0, 0);
-        recorder->frameQueued(n, 10 * static_cast<nsecs_t>(n));
+        recorder->frameQueued(n, 10 * static_cast<nsecs_t>(n), 10 * static_cast<nsecs_t>(n));
     }
     // Items (frame, weight): a blend, the same blend, a single new frame, an empty state, the
     // frame from before the empty state again.

@@ -98,6 +98,23 @@ TEST(OptionsTest, refusesImpossibleOptionsAndSettingsWithOneLineEach) {
             {{"--set=alphaFunction="}, "--set: alphaFunction needs at least one x,y point"},
             // Control characters stay off the line.
             {{"--set=a\nb=1"}, "--set: unknown settings key \"a?b\""},
+            {{"--compare=0,7"},
+             "--compare expects modes from 0 to 5, separated by commas (got \"0,7\")"},
+            {{"--compare=3,3"}, "--compare names mode 3 twice"},
+            {{"--compare=2"}, "--compare expects two or more modes (got \"2\")"},
+            {{"--compare=0,2", "--mode=1"}, "--compare gives the modes: drop --mode"},
+            {{"--compare=0,2", "--sweep=delayMs=1"},
+             "--compare and --sweep run grids of their own: give one"},
+            {{"--sweep=delayMs=30,x"}, "--sweep: delayMs expects a whole number (got \"x\")"},
+            {{"--sweep=alphaFunction=0"},
+             "--sweep cannot sweep alphaFunction: its values hold commas"},
+            {{"--sweep=a=1", "--sweep=b=1"},
+             "--sweep expects a settings key and its values, key=v1,v2,... (got \"a=1\")"},
+            {{"--sweep=rfps=1", "--sweep=rfps=2"}, "--sweep gives rfps twice"},
+            {{"--sweep=rfps=1", "--sweep=rfpsOffset=2", "--sweep=hitTarget=1"},
+             "--sweep takes two keys at most"},
+            {{"--latency-budget-ms=40"},
+             "--latency-budget-ms marks the cells of a --sweep: add one"},
     };
     for (const auto& [args, message] : cases) {
         EXPECT_EQ("verolux-sim: " + message, parse(args).error) << args[0];
