@@ -121,11 +121,12 @@ void LayerHost::releaseLoop(sp<ReleasePicker> picker) {
             return mQueueChanges;
         }();
         const FrameItem frame = picker->selectFrameForRelease();
-        recordReleases();
         if (frame.mIndex != NO_FRAME) {
+            // The game waits for this buffer: let it go first, and record after.
             releaseFrame(frame);
             continue;
         }
+        recordReleases();
         // Nothing to release. Some policies say so at once (an empty queue), so ask again only
         // after an event the picker decides on, or after the picker's own event wait.
         std::unique_lock lock(mChangeMutex);
@@ -153,11 +154,11 @@ LayerHost::ReleaseStep LayerHost::stepRelease() {
     const bool eventCame = releaseEvents() != eventsBefore;
     switch (choice.action) {
         case ReleaseChoice::RELEASE:
-            recordReleases();
             if (choice.frame.mIndex != NO_FRAME) {
                 releaseFrame(choice.frame);
                 return {Next::DECIDE, now};
             }
+            recordReleases();
             // Nothing to release: the release thread waits for an event, as below.
             break;
         case ReleaseChoice::WAIT_FOR_TIME:
@@ -179,8 +180,11 @@ LayerHost::ReleaseStep LayerHost::stepRelease() {
 void LayerHost::finishSleepingRelease() {
     if (mPicker == nullptr) return;
     const FrameItem frame = mPicker->chooseOldestFrame().frame;
-    recordReleases();
-    if (frame.mIndex != NO_FRAME) releaseFrame(frame);
+    if (frame.mIndex != NO_FRAME) {
+        releaseFrame(frame);
+    } else {
+        recordReleases();
+    }
 }
 
 uint64_t LayerHost::releaseEvents() const {
