@@ -216,9 +216,14 @@ FrameItem ReleasePicker::selectFrameForRelease() {
 }
 
 void ReleasePicker::stop() {
-    std::unique_lock lock(mMutex);
-    mContinue = false;
+    {
+        std::lock_guard lock(mMutex);
+        mContinue = false;
+    }
+    // Woken with the mutex free, a waiting selection runs on at once; woken under it, it would
+    // block on the mutex and wait for a second wake-up once this thread waits below.
     mCondition.notify_all();
+    std::unique_lock lock(mMutex);
     mSelectionsDone.wait(lock, [this] { return mActiveSelections == 0; });
 }
 
