@@ -13,41 +13,36 @@ TextLine& TextLine::operator<<(std::string_view text) {
     return *this;
 }
 
+template <typename... Format>
+TextLine& TextLine::appendChars(Format... format) {
+    const auto [end, ec] = std::to_chars(mText + mSize, mText + CAPACITY, format...);
+    if (ec == std::errc()) mSize = end - mText;
+    return *this;
+}
+
 TextLine& TextLine::operator<<(char c) {
     if (mSize < CAPACITY) mText[mSize++] = c;
     return *this;
 }
 
 TextLine& TextLine::signedInteger(int64_t value) {
-    const auto [end, ec] = std::to_chars(mText + mSize, mText + CAPACITY, value);
-    if (ec == std::errc()) mSize = end - mText;
-    return *this;
+    return appendChars(value);
 }
 
 TextLine& TextLine::unsignedInteger(uint64_t value) {
-    const auto [end, ec] = std::to_chars(mText + mSize, mText + CAPACITY, value);
-    if (ec == std::errc()) mSize = end - mText;
-    return *this;
+    return appendChars(value);
 }
 
 TextLine& TextLine::fixed(double value, int decimals) {
-    const auto [end, ec] = std::to_chars(mText + mSize, mText + CAPACITY, value,
-                                         std::chars_format::fixed, decimals);
-    if (ec == std::errc()) mSize = end - mText;
-    return *this;
+    return appendChars(value, std::chars_format::fixed, decimals);
 }
 
 TextLine& TextLine::general(double value, int precision) {
-    const auto [end, ec] = std::to_chars(mText + mSize, mText + CAPACITY, value,
-                                         std::chars_format::general, precision);
-    if (ec == std::errc()) mSize = end - mText;
-    return *this;
+    return appendChars(value, std::chars_format::general, precision);
 }
 
 TextLine& TextLine::shortest(float value) {
-    const auto [end, ec] = std::to_chars(mText + mSize, mText + CAPACITY, value);
-    if (ec == std::errc()) mSize = end - mText;
-    return *this;
+    return appendChars(value);
 }
 
 TextLine& TextLine::thousandths(int64_t value) {

@@ -41,6 +41,9 @@ public:
 private:
     TextLine& signedInteger(int64_t value);
     TextLine& unsignedInteger(uint64_t value);
+    // Appends std::to_chars(value, format...), or nothing when it does not fit.
+    template <typename... Format>
+    TextLine& appendChars(Format... format);
 
     char mText[CAPACITY];
     size_t mSize = 0;
