@@ -66,7 +66,7 @@ ReleasePicker::ReleasePicker(sp<FrameList>& frameList, String8& name, const uint
 ReleasePicker::~ReleasePicker() {
     ILOG(2, "Interpolation::ReleasePicker [%s] destructor", mName.c_str());
     ILOG(2, "Interpolation::ReleasePicker: [%s] stop", mName.c_str());
-    stop();
+    stopAndWaitForSelections();
 }
 
 void ReleasePicker::onFirstRef() {
@@ -79,7 +79,7 @@ void ReleasePicker::onLastStrongRef(const void* /*id*/) {
     EventDispatcher::unsubscribe(mUid, EVENT_FLAGS, this);
     // Stopping here rather than in the destructor keeps a selection that is still running from
     // calling into a subclass that is already destroyed.
-    stop();
+    stopAndWaitForSelections();
 }
 
 void ReleasePicker::onEvent(const EventType& type, const nsecs_t& /*time*/, const EventData& data) {
@@ -220,9 +220,13 @@ void ReleasePicker::stop() {
         std::lock_guard lock(mMutex);
         mContinue = false;
     }
+    mCondition.notify_all();
+}
+
+void ReleasePicker::stopAndWaitForSelections() {
     // Woken with the mutex free, a waiting selection runs on at once; woken under it, it would
     // block on the mutex and wait for a second wake-up once this thread waits below.
-    mCondition.notify_all();
+    stop();
     std::unique_lock lock(mMutex);
     mSelectionsDone.wait(lock, [this] { return mActiveSelections == 0; });
 }

@@ -5,13 +5,7 @@
 #include <ui/GraphicBuffer.h>
 #include <utils/String8.h>
 
-#include <atomic>
-#include <condition_variable>
-#include <functional>
-#include <limits>
 #include <memory>
-#include <mutex>
-#include <thread>
 #include <vector>
 
 #include "CompositionDeadlinePredictor.h"
@@ -22,6 +16,7 @@
 #include "RealFPSTracker.h"
 #include "ReleasePicker.h"
 #include "RenderStateBuilder.h"
+#include "host/FrameRelease.h"
 #include "host/LayerMonitor.h"
 #include "host/LayerRates.h"
 #include "host/LayerSettings.h"
@@ -61,7 +56,7 @@ public:
 
     // Runs on the thread whose removal took the frame out of the list, with the list's and the
     // event bus's mutexes held: it must be short and must not call into the host or the library.
-    using FrameReleasedCallback = std::function<void(const android::FrameItem& frame)>;
+    using FrameReleasedCallback = FrameRelease::FrameReleasedCallback;
 
     LayerHost(Config config, FrameReleasedCallback onFrameReleased);
     ~LayerHost();
@@ -71,34 +66,17 @@ public:
     // Starts the release thread.
     void start();
 
-    // What the release side does next after stepRelease(), for a host that keeps time itself and
-    // runs no release thread (a simulation). A wait ends at the time given or, unless it is a
-    // sleep, at the next event the picker decides on (releaseEvents() moves), whichever comes
-    // first; then the host calls stepRelease() again (after a sleep, finishSleepingRelease()).
-    struct ReleaseStep {
-        enum class Next {
-            DECIDE,          // decide again at once: a frame went, or an event came meanwhile
-            WAIT_FOR_EVENT,  // nothing to release; `until` is where the event wait runs out
-            WAIT_UNTIL,      // the policy asked to be asked again at `until`
-            SLEEP_UNTIL,     // the latency picker's sleep: no decision until `until`
-        };
-        Next next = Next::DECIDE;
-        nsecs_t until = 0;
-    };
-    // One step of what the release thread does, without its waits: one decision through the
-    // picker's decideRelease(), the release it names, and what to wait for. Both hosts run the
-    // same decisions; the release thread blocks in selectFrameForRelease() instead. Called between
-    // compositions (a composed frame stays locked until onCompositionDone), never while the
-    // release thread runs.
+    // The release side, one decision at a time, for a host that keeps time itself and runs no
+    // release thread (a simulation): see FrameRelease::step(). Called between compositions (a
+    // composed frame stays locked until onCompositionDone), never while the release thread runs.
+    using ReleaseStep = FrameRelease::Step;
     ReleaseStep stepRelease();
-    // The end of a SLEEP_UNTIL: releases the oldest frame as it is now, as the latency picker
-    // does after its sleep.
     void finishSleepingRelease();
-    // Counts the events after which the picker may decide otherwise.
     uint64_t releaseEvents() const;
-    // Tear-down, in the order that never blocks: no more waiting on frame locks, the picker stops,
-    // which ends the release thread's wait whatever it waits for, the release thread ends, the
-    // frames still queued are handed back. Refreshes and buffers must have stopped.
+    // Tear-down, in an order that never waits for the release thread to run: the thread is told to
+    // stop (its waits end, and it ends on its own), waits on frame locks end, the frames still
+    // queued are handed back, and then no frame reaches the FrameReleasedCallback any more.
+    // Refreshes and buffers must have stopped.
     void stop();
 
     // The buffer queue's side. An acquisition that comes after the engine has already let the frame
@@ -137,17 +115,6 @@ public:
     const android::sp<android::FrameList>& frameList() const { return mFrameList; }
 
 private:
-    class ReleaseListener;
-
-    static constexpr uint64_t NO_FRAME = std::numeric_limits<uint64_t>::max();
-
-    void noteQueueChange();
-    void noteFrameLeft(uint64_t frameNumber, int slot);
-    void releaseLoop(android::sp<android::Interpolation::ReleasePicker> picker);
-    // Takes the frame the picker chose out of the list and hands it back.
-    void releaseFrame(const android::FrameItem& frame);
-    void setLeavingFrame(uint64_t frameNumber);
-    void recordReleases();
     void latchNewestFrame();
     // Lets go the frames that no later refresh will show.
     void clearUnusedFrames(nsecs_t displayTime);
@@ -157,15 +124,10 @@ private:
     const android::sp<android::Interpolation::FrameTimingsAggregator> mTimings;
     android::sp<android::Interpolation::FrameInterceptor> mInterceptor;
     android::sp<android::Interpolation::RenderStateBuilder> mBuilder;
-    android::sp<android::Interpolation::ReleasePicker> mPicker;
     const android::sp<android::Interpolation::MachineLearning::RealFPSTracker> mRealFps;
     const android::sp<android::Interpolation::MachineLearning::CompositionDeadlinePredictor>
             mDeadlinePredictor;
-    const FrameReleasedCallback mOnFrameReleased;
-    android::sp<ReleaseListener> mReleaseListener;
-    // Frames leaving the list, to hand them back, and the events after which the picker may
-    // decide otherwise, to ask it again when it had nothing to release.
-    uint32_t mListenedEvents = 0;
+    android::sp<FrameRelease> mRelease;
     const android::sp<LayerSettings> mSettings;
     // Before the rates, so that the ring log hears the render-rate agent's first announcement.
     LayerMonitor mMonitor;
@@ -177,38 +139,10 @@ private:
     bool mLatchedByHost = false;
     RefreshClassifier mClassifier;
 
-    std::atomic<bool> mRunning{false};
-    std::thread mReleaseThread;
-
-    mutable std::mutex mChangeMutex;  // a leaf lock: taken from event delivery
-    std::condition_variable mQueueChanged;
-    uint64_t mQueueChanges = 0;  // guarded by mChangeMutex
-
-    // Held across the acquisition of a frame, so that a frame is never acquired into the queue
-    // after it left it: a frame that has left is no longer among mQueuedFrames, and the one the
-    // release thread is taking out is mLeavingFrame. The removal itself waits on frame locks, which
-    // a composition may hold for as long as it likes, so it never holds this mutex: the
-    // composition thread acquires. Taken before the list's mutex.
-    std::mutex mAcquireMutex;
-    uint64_t mLeavingFrame = NO_FRAME;  // guarded by mAcquireMutex
-
-    // Frames that left the list, whose release the frame timings have not recorded yet: the
-    // listener cannot record them itself, since that broadcasts from inside a broadcast.
-    std::mutex mReleasedMutex;
-    std::vector<int> mReleasedSlots;  // guarded by mReleasedMutex
-    // Frames queued into the engine that have not left it yet; at most one per buffer.
-    std::vector<uint64_t> mQueuedFrames;  // guarded by mReleasedMutex
-    std::mutex mRecordingMutex;
-    std::vector<int> mReleasedScratch;  // guarded by mRecordingMutex
-
     // The fences of frames the composition thread is done with; the buffer queue's thread drops
     // them.
     RetiredFences mRetiredFences;
 };
-
-// Sets up the calling thread as the host sets up its release thread: named, and with the least
-// timer slack, so that a timed release wakes when it is due.
-void configureReleaseThread();
 
 // Delivers settings as the controlling service does: an updateSettings parcel for the uid, then
 // notifyChanges. Returns updateSettings' result.

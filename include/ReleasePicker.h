@@ -75,10 +75,11 @@ public:
     // never wake a waiting selection.
     uint32_t decisionEvents() const { return mDecisionEvents; }
     // Ends every selection for good: a selection waiting for an event or a time returns the empty
-    // frame at once, later ones return it without deciding. Returns once no thread is inside
-    // selectFrameForRelease(), which takes at most the rest of a policy step (the latency picker's
-    // sleep). The last reference stops the picker too; a host stops it first so that its release
-    // thread, which holds a reference while it selects, is not left waiting.
+    // frame as soon as its thread runs, later ones return it without deciding. It does not wait for
+    // them, and a selection in the middle of a policy step (the latency picker's sleep) finishes
+    // that step: a host whose release thread holds its own reference to the picker stops it and
+    // goes on. The last reference stops the picker too, and then waits until no thread is inside
+    // selectFrameForRelease(), so that no selection runs on in a destroyed picker.
     void stop();
 
 protected:
@@ -115,6 +116,7 @@ private:
         nsecs_t compositionEstimate = 0;
     };
 
+    void stopAndWaitForSelections();
     void applyInboxLocked();
     void wakeSelection(bool decisionEvent);
     // One step: the inbox, then the policy in its blocking (tryRelease) or non-blocking
