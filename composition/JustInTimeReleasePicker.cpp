@@ -20,7 +20,7 @@ void JustInTimeReleasePicker::onLastStrongRef(const void* /*id*/) {
     EventDispatcher::unsubscribe(mUid, EVENT_FLAGS, static_cast<ReleasePicker*>(this));
     SettingsController::getInstance()->unsubscribe(
             wp<SettingsController::Observer>(static_cast<SettingsController::Observer*>(this)));
-    stop();
+    stopAndWaitForSelections();
 }
 
 void JustInTimeReleasePicker::onSettingsChanged(const Settings& settings) {

@@ -37,7 +37,7 @@ void MLLatencyReductionReleasePicker::onLastStrongRef(const void* /*id*/) {
     EventDispatcher::unsubscribe(mUid, EVENT_FLAGS, static_cast<ReleasePicker*>(this));
     EventDispatcher::unsubscribe(mUid, eFrameReceivedEvent, primaryReceiver());
     // Before the destructors run, so that no selection is left inside this object (see the base).
-    stop();
+    stopAndWaitForSelections();
 }
 
 void MLLatencyReductionReleasePicker::setFrameListCapacity(size_t capacity) {

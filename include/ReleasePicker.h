@@ -90,6 +90,9 @@ protected:
     // The policy step without blocking: the same as tryRelease() unless the policy blocks, which it
     // then expresses as a choice (RELEASE_AFTER_SLEEP). Runs with mMutex held.
     virtual ReleaseChoice decideLocked() { return tryRelease(); }
+    // stop(), then waits until no thread is inside selectFrameForRelease(): what the last reference
+    // does, before the subclass's part of the picker is destroyed.
+    void stopAndWaitForSelections();
     // Reads the queue's size and logs the policy step of `pickerName`.
     size_t beginTryReleaseLocked(const char* pickerName);
     // Release the oldest frame once the composed picture has reached its display time.
@@ -116,7 +119,6 @@ private:
         nsecs_t compositionEstimate = 0;
     };
 
-    void stopAndWaitForSelections();
     void applyInboxLocked();
     void wakeSelection(bool decisionEvent);
     // One step: the inbox, then the policy in its blocking (tryRelease) or non-blocking
