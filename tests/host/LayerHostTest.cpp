@@ -7,6 +7,7 @@
 #include <future>
 #include <limits>
 #include <mutex>
+#include <numeric>
 #include <random>
 #include <set>
 #include <thread>
@@ -165,6 +166,14 @@ TEST_P(LayerHostTest, tearDownEndsTheReleaseThreadWhateverItWaitsForAndWhateverT
                                 EXPECT_EQ(0u, host->frameList()->size());
                                 host.reset();
                             }).count());
+        // Every buffer came back once, whether the release thread or the tear-down let it go.
+        std::vector<uint64_t> frames = returned();
+        std::sort(frames.begin(), frames.end());
+        std::vector<uint64_t> queued(n);
+        std::iota(queued.begin(), queued.end(), 1);
+        EXPECT_EQ(queued, frames);
+        std::lock_guard lock(mMutex);
+        mReturned.clear();
     }
     const auto ended = [&] {
         return std::none_of(releaseThreadsLists.begin(), releaseThreadsLists.end(),
